@@ -1,0 +1,14 @@
+#include "pipeline/FeatureReport.h"
+
+#include "pipeline/LittleEndian.h"
+
+namespace VeltoTouch::FeatureReport {
+
+std::optional<FactoryResetHoldDuration> FactoryResetHoldDuration::parse(const std::uint8_t* data,
+                                                                        std::size_t length) noexcept
+{
+    if (length < kLength || data[0] != kReportID) return std::nullopt;
+    return FactoryResetHoldDuration{LittleEndian::u32(data + 1)};
+}
+
+}  // namespace VeltoTouch::FeatureReport
