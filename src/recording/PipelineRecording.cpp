@@ -1,0 +1,352 @@
+#include "recording/PipelineRecording.h"
+
+#include "pipeline/Util.h"
+#include "platform/MonotonicClock.h"
+#include "platform/PropertyDictionary.h"
+#include "recording/JsonValue.h"
+
+#include <nlohmann/json.hpp>
+
+#include <limits>
+#include <stdexcept>
+#include <string_view>
+#include <unordered_set>
+#include <utility>
+
+namespace VeltoTouch {
+
+using VeltoHost::MonotonicClock;
+using VeltoHost::PropertyDictionary;
+
+namespace {
+
+constexpr std::uint64_t kContainerVersion = 1;
+constexpr std::string_view kMigrationFailed = "migrateSerializedContainer failed: ";
+
+// Container keys and frame type names.
+constexpr std::string_view kVersionKey = "Version";
+constexpr std::string_view kFramesKey = "Frames";
+constexpr std::string_view kTypeKey = "Type";
+constexpr std::string_view kTimestampKey = "Timestamp";
+constexpr std::string_view kKeyKey = "Key";
+constexpr std::string_view kValueKey = "Value";
+constexpr std::string_view kReportKey = "Report";
+constexpr std::string_view kStateType = "State";
+constexpr std::string_view kInputReportType = "InputReport";
+// Version 0.
+constexpr std::string_view kReportsKey = "Reports";
+constexpr std::string_view kReportDataKey = "ReportData";
+
+[[noreturn]] void reject(const char* message) { throw std::invalid_argument(message); }
+
+PropertyValue migrateVersion0(const PropertyDictionary& container)
+{
+    PropertyValue::Array frames;
+    const PropertyValue reports = container.get(kReportsKey);
+    if (reports.hasValue()) {
+        if (!reports.isArray()) reject("invalid reports");
+        frames.reserve(reports.asArray().size());
+        for (const PropertyValue& element : reports.asArray()) {
+            if (!element.isDictionary()) reject("report is not an object");
+            const PropertyDictionary& report = element.asDictionary();
+            // Presence only: the kinds are checked by the frame reader.
+            if (!report.contains(kTimestampKey)) reject("frame lacks Timestamp");
+            if (!report.contains(kReportDataKey)) reject("frame lacks ReportData");
+            PropertyDictionary frame;
+            frame.set(std::string(kTimestampKey), report.get(kTimestampKey));
+            frame.set(std::string(kTypeKey), PropertyValue::string(std::string(kInputReportType)));
+            frame.set(std::string(kReportKey), report.get(kReportDataKey));
+            frames.push_back(PropertyValue::dictionary(std::move(frame)));
+        }
+    }
+    PropertyDictionary migrated;
+    migrated.set(std::string(kVersionKey), PropertyValue::uint64(kContainerVersion));
+    migrated.set(std::string(kFramesKey), PropertyValue::array(std::move(frames)));
+    return PropertyValue::dictionary(std::move(migrated));
+}
+
+PipelineRecording::Frame readFrame(const PropertyValue& element)
+{
+    using Frame = PipelineRecording::Frame;
+    if (!element.isDictionary()) reject("frame is not an object");
+    const PropertyDictionary& object = element.asDictionary();
+
+    // The checks run in this order, so the first missing piece is reported.
+    const PropertyValue type = object.get(kTypeKey);
+    if (!type.isString()) reject("invalid frame type");
+    const PropertyValue timestamp = object.get(kTimestampKey);
+    if (!timestamp.isNumberOrBoolean()) reject("invalid frame timestamp");
+
+    Frame frame;
+    frame.timestampNs = timestamp.toUInt64();
+    if (type.asString() == kStateType) {
+        const PropertyValue key = object.get(kKeyKey);
+        if (!key.isString()) reject("invalid state key");
+        frame.type = Frame::Type::State;
+        frame.key = key.asString();
+        // Absent means "no value"; a present entry must hold a value (JSON
+        // null included), which every parsed entry does.
+        if (object.contains(kValueKey)) {
+            frame.value = object.get(kValueKey);
+            if (!frame.value.hasValue()) reject("invalid state value class");
+        }
+    } else if (type.asString() == kInputReportType) {
+        const PropertyValue report = object.get(kReportKey);
+        if (!report.isString()) reject("invalid report");
+        frame.type = Frame::Type::InputReport;
+        frame.report = Util::bytesFromHexString(report.asString());
+    } else {
+        reject("invalid frame type");
+    }
+    return frame;
+}
+
+}  // namespace
+
+PipelineRecording::PipelineRecording() : sleepMicroseconds(&MonotonicClock::sleepMicroseconds) {}
+
+PipelineRecording::PipelineRecording(std::optional<std::string_view> data) : PipelineRecording()
+{
+    if (!data) reject("json not supplied");
+    PropertyValue container;
+    try {
+        container = migrateSerializedContainer(JsonValue::parse(*data));
+    } catch (const std::exception& error) {
+        throw std::runtime_error(std::string(kMigrationFailed) + error.what());
+    }
+    readFrames(container, _frames);
+}
+
+PipelineRecording::PipelineRecording(const PipelineRecording& other)
+    : PipelineInput(other),
+      pipeline(other.pipeline),
+      sleepMicroseconds(other.sleepMicroseconds),
+      _frames(other._frames),
+      _maxFrameCount(other._maxFrameCount)
+{
+    // _play stays not valid: the source's position belongs to the source's list.
+}
+
+PipelineRecording& PipelineRecording::operator=(const PipelineRecording& other)
+{
+    if (this == &other) return *this;
+    pipeline = other.pipeline;
+    sleepMicroseconds = other.sleepMicroseconds;
+    _frames = other._frames;
+    _maxFrameCount = other._maxFrameCount;
+    _play = PlayCursor{};
+    return *this;
+}
+
+PipelineRecording::PipelineRecording(PipelineRecording&& other) noexcept
+    : PipelineInput(other),
+      pipeline(std::move(other.pipeline)),
+      sleepMicroseconds(std::move(other.sleepMicroseconds)),
+      _frames(std::move(other._frames)),
+      _maxFrameCount(other._maxFrameCount)
+{
+    other._play = PlayCursor{};
+}
+
+PipelineRecording& PipelineRecording::operator=(PipelineRecording&& other) noexcept
+{
+    if (this == &other) return *this;
+    pipeline = std::move(other.pipeline);
+    sleepMicroseconds = std::move(other.sleepMicroseconds);
+    _frames = std::move(other._frames);
+    _maxFrameCount = other._maxFrameCount;
+    _play = PlayCursor{};
+    other._play = PlayCursor{};
+    return *this;
+}
+
+void PipelineRecording::setTime(std::uint64_t) {}
+
+void PipelineRecording::setState(const std::string& key, PropertyValue value)
+{
+    // One clock reading serves both the frame and the forwarded time, so a
+    // replay sees the same time line as the live pipeline did.
+    const std::uint64_t now = MonotonicClock::now();
+    Frame frame;
+    frame.type = Frame::Type::State;
+    frame.timestampNs = Util::nanosecondsFromMachTime(now);
+    frame.key = key;
+    frame.value = value;
+    appendFrame(std::move(frame));
+    if (pipeline) {
+        pipeline->setTime(now);
+        pipeline->setState(key, std::move(value));
+    }
+}
+
+void PipelineRecording::handleInputReport(const std::uint8_t* data, std::size_t length)
+{
+    const std::uint64_t now = MonotonicClock::now();
+    Frame frame;
+    frame.type = Frame::Type::InputReport;
+    frame.timestampNs = Util::nanosecondsFromMachTime(now);
+    if (length > 0) frame.report.assign(data, data + length);
+    appendFrame(std::move(frame));
+    if (pipeline) {
+        pipeline->setTime(now);
+        pipeline->handleInputReport(data, length);
+    }
+}
+
+void PipelineRecording::appendFrame(Frame frame)
+{
+    _frames.push_back(std::move(frame));
+    // Trimming is deferred until the list holds twice the limit, so its pass
+    // over the list is paid about once per `limit` appends.
+    if (_maxFrameCount != 0 && _frames.size() / 2 >= _maxFrameCount) trimFrames(_frames, _maxFrameCount);
+    _play.valid = false;
+}
+
+void PipelineRecording::trimFrames(FrameList& frames, std::uint64_t limit)
+{
+    std::uint64_t keptReports = 0;
+    // Keys of the state frames kept since the last kept report (walking back).
+    // The views point into kept frames, which outlive the pass.
+    std::unordered_set<std::string_view> keysSinceReport;
+    for (auto it = frames.end(); it != frames.begin();) {
+        --it;
+        bool keep = true;
+        switch (it->type) {
+        case Frame::Type::InputReport:
+            keep = keptReports < limit;
+            if (keep) {
+                ++keptReports;
+                keysSinceReport.clear();
+            }
+            break;
+        case Frame::Type::State:
+            // A newer frame of the same key, up to the next kept report,
+            // overrides this one.
+            keep = keysSinceReport.insert(it->key).second;
+            break;
+        }
+        if (!keep) it = frames.erase(it);
+    }
+}
+
+void PipelineRecording::trimToLimit()
+{
+    const std::size_t before = _frames.size();
+    trimFrames(_frames, _maxFrameCount);
+    // The cursor may point at an erased frame; it must not be used again.
+    if (_frames.size() != before) _play.valid = false;
+}
+
+void PipelineRecording::setMaxFrameCount(std::uint64_t limit)
+{
+    _maxFrameCount = limit;
+    if (_maxFrameCount != 0) trimToLimit();
+}
+
+PropertyValue PipelineRecording::migrateSerializedContainer(PropertyValue container)
+{
+    if (!container.isDictionary()) reject("invalid container");
+    const PropertyDictionary& object = container.asDictionary();
+    const PropertyValue version = object.get(kVersionKey);
+    if (!version.isNumberOrBoolean()) reject("invalid version");
+    switch (version.toUInt64()) {
+    case 1:
+        return container;
+    case 0:
+        return migrateVersion0(object);
+    default:
+        throw std::invalid_argument("invalid container version: " + std::to_string(version.toUInt64()));
+    }
+}
+
+void PipelineRecording::readFrames(const PropertyValue& container, FrameList& frames)
+{
+    const PropertyValue array = container.asDictionary().get(kFramesKey);
+    if (!array.isArray()) reject("invalid frames");
+    // Loaded as they stand: no limit, no trimming, no check of time order.
+    for (const PropertyValue& element : array.asArray()) frames.push_back(readFrame(element));
+}
+
+std::string PipelineRecording::json()
+{
+    if (_maxFrameCount != 0) trimToLimit();
+
+    nlohmann::ordered_json frames = nlohmann::ordered_json::array();
+    for (const Frame& frame : _frames) {
+        nlohmann::ordered_json object = nlohmann::ordered_json::object();
+        switch (frame.type) {
+        case Frame::Type::State:
+            object[kTypeKey] = kStateType;
+            object[kTimestampKey] = frame.timestampNs;
+            object[kKeyKey] = frame.key;
+            // Values JSON cannot hold are written as JsonValue::toJson says:
+            // byte data as hex text, non-finite numbers as null; invalid UTF-8
+            // becomes U+FFFD. Writing never fails.
+            if (frame.value.hasValue()) object[kValueKey] = JsonValue::toJson(frame.value);
+            break;
+        case Frame::Type::InputReport:
+            object[kTypeKey] = kInputReportType;
+            object[kTimestampKey] = frame.timestampNs;
+            object[kReportKey] = Util::hexStringFromBytes(frame.report);
+            break;
+        default:
+            continue;
+        }
+        frames.push_back(std::move(object));
+    }
+
+    nlohmann::ordered_json container = nlohmann::ordered_json::object();
+    container[kVersionKey] = kContainerVersion;
+    container[kFramesKey] = std::move(frames);
+    return JsonValue::dump(container, true);
+}
+
+void PipelineRecording::playReset()
+{
+    _play.valid = true;
+    _play.iterator = _frames.begin();
+    _play.startTimeMach = MonotonicClock::now();
+    _play.lastInputReportTimeNs.reset();
+}
+
+bool PipelineRecording::playCanContinue() const noexcept { return _play.valid && _play.iterator != _frames.end(); }
+
+void PipelineRecording::playNextFrame(float speed)
+{
+    if (!playCanContinue()) throw std::runtime_error("playback finished");
+    if (!(speed > 0.0f)) speed = 1.0f;
+
+    const Frame& frame = *_play.iterator;
+    ++_play.iterator;
+
+    if (frame.type == Frame::Type::InputReport) {
+        if (_play.lastInputReportTimeNs && frame.timestampNs > *_play.lastInputReportTimeNs) {
+            // Single precision throughout, truncated to whole microseconds.
+            const float elapsedNs = static_cast<float>(frame.timestampNs - *_play.lastInputReportTimeNs);
+            const float microseconds = elapsedNs / speed / 1000.0f;
+            // A tiny speed can push the wait past what 64 bits hold.
+            constexpr float kLongestWait = 18446744073709551615.0f;
+            const std::uint64_t wait = microseconds < kLongestWait ? static_cast<std::uint64_t>(microseconds)
+                                                                  : std::numeric_limits<std::uint64_t>::max();
+            if (sleepMicroseconds) sleepMicroseconds(wait);
+        }
+        _play.lastInputReportTimeNs = frame.timestampNs;
+    }
+
+    if (!pipeline) return;
+
+    // The replayed time line starts at playReset and keeps the recorded
+    // spacing whatever the speed; it is measured from the list's first frame.
+    const std::uint64_t offsetNs = frame.timestampNs - _frames.front().timestampNs;
+    pipeline->setTime(_play.startTimeMach + Util::machTimeFromNanoseconds(offsetNs));
+    switch (frame.type) {
+    case Frame::Type::InputReport:
+        pipeline->handleInputReport(frame.report.data(), frame.report.size());
+        break;
+    case Frame::Type::State:
+        pipeline->setState(frame.key, frame.value);
+        break;
+    }
+}
+
+}  // namespace VeltoTouch

@@ -1,0 +1,119 @@
+#pragma once
+
+#include "pipeline/PipelineInput.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <list>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace VeltoTouch {
+
+// Stands in front of another PipelineInput and records every input report and
+// state change as a time-stamped frame before forwarding it unchanged. The
+// recording is kept to the newest `_maxFrameCount` input reports plus the state
+// frames still in force for them, can be written to and read from a JSON
+// container, and can be replayed into the wrapped input.
+//
+// Not thread-safe: the owner serialises every call, copies included. Recording
+// never throws; reading a container and playing past the end do.
+class PipelineRecording : public PipelineInput {
+public:
+    struct Frame {
+        enum class Type : std::uint32_t { State = 0, InputReport = 1 };
+
+        Type type = Type::State;
+        // Capture time in nanoseconds of the monotonic clock (its own origin).
+        std::uint64_t timestampNs = 0;
+        // State frames: the key exactly as received.
+        std::string key;
+        // State frames: the value as given, shared. An empty reference (no
+        // value) is distinct from a value of kind null.
+        PropertyValue value;
+        // Input report frames: the raw bytes as delivered.
+        std::vector<std::uint8_t> report;
+    };
+    using FrameList = std::list<Frame>;
+
+    // The wrapped input; empty means record only.
+    std::shared_ptr<PipelineInput> pipeline;
+
+    // How playback waits between input reports. Tests replace it to run
+    // without waiting; copies share it.
+    std::function<void(std::uint64_t microseconds)> sleepMicroseconds;
+
+    PipelineRecording();
+    // Reads a container (UTF-8 JSON, version 0 or 1). std::nullopt stands for
+    // "no data at all", which raises std::invalid_argument("json not supplied");
+    // an empty text is data that is not a container. Errors of the parse and
+    // of migrateSerializedContainer come as std::runtime_error prefixed with
+    // "migrateSerializedContainer failed: "; errors in the frames as
+    // std::invalid_argument. The result has no wrapped input, no limit and a
+    // cursor that is not valid.
+    explicit PipelineRecording(std::optional<std::string_view> data);
+
+    // A copy shares the wrapped input and the state values, has its own frame
+    // list and limit, and a playback cursor that is not valid.
+    PipelineRecording(const PipelineRecording& other);
+    PipelineRecording& operator=(const PipelineRecording& other);
+    // Moving takes the frames over; the cursor is not valid afterwards, since
+    // an end position does not survive the move of a list.
+    PipelineRecording(PipelineRecording&& other) noexcept;
+    PipelineRecording& operator=(PipelineRecording&& other) noexcept;
+    ~PipelineRecording() = default;
+
+    // PipelineInput. The recorder reads the clock itself, so setTime is ignored.
+    void setTime(std::uint64_t time) override;
+    void setState(const std::string& key, PropertyValue value) override;
+    void handleInputReport(const std::uint8_t* data, std::size_t length) override;
+
+    void appendFrame(Frame frame);
+    // Keeps the newest `limit` input reports and, per key, the newest state
+    // frame of each stretch between kept reports plus the newest one before
+    // the oldest kept report. `limit` must be greater than 0.
+    static void trimFrames(FrameList& frames, std::uint64_t limit);
+    // 0 removes the limit; any other value trims at once.
+    void setMaxFrameCount(std::uint64_t limit);
+    std::uint64_t maxFrameCount() const noexcept { return _maxFrameCount; }
+
+    const FrameList& frames() const noexcept { return _frames; }
+
+    // Turns a parsed container of any accepted version into one of the
+    // current version; raises std::invalid_argument. A current container is
+    // returned as the same value.
+    static PropertyValue migrateSerializedContainer(PropertyValue container);
+    // The recording as an indented version-1 container. Trims to the limit
+    // first, so it changes the recording.
+    std::string json();
+
+    // Playback: playReset once, then playNextFrame while playCanContinue.
+    void playReset();
+    bool playCanContinue() const noexcept;
+    // Plays one frame into the wrapped input, first waiting as long as the
+    // recorded spacing of input reports divided by `speed` (not above 0 means
+    // 1.0). Throws std::runtime_error("playback finished") when there is no
+    // frame to play.
+    void playNextFrame(float speed);
+
+private:
+    struct PlayCursor {
+        bool valid = false;
+        FrameList::iterator iterator;
+        std::uint64_t startTimeMach = 0;
+        std::optional<std::uint64_t> lastInputReportTimeNs;
+    };
+
+    void trimToLimit();
+    static void readFrames(const PropertyValue& container, FrameList& frames);
+
+    FrameList _frames;
+    std::uint64_t _maxFrameCount = 0;
+    PlayCursor _play;
+};
+
+}  // namespace VeltoTouch
