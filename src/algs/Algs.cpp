@@ -1,10 +1,19 @@
 #include "algs/Algs.h"
 
+#include "pipeline/Util.h"
+#include "platform/PropertyDictionary.h"
+
+#include <cstdarg>
+#include <cstdio>
+#include <sstream>
+#include <utility>
+
 namespace VeltoTouch {
 
 using VeltoHost::HidEvent;
 using VeltoHost::HidEventList;
 using VeltoHost::HidEventRef;
+using VeltoHost::LogLevel;
 
 namespace {
 
@@ -12,6 +21,14 @@ constexpr std::uint32_t kTransducerFinger = 2;
 constexpr std::uint32_t kEventMaskNone = 0;
 constexpr std::uint32_t kEventMaskHold = 0x00000002;
 constexpr std::uint32_t kEventMaskTap = 0x00020000;
+
+// Gain of each pad A..O, evening out the pads' different sizes and distances
+// from the cover.
+constexpr std::array<float, InputReport::kPadCount> kPadGains = {
+    1.9219f, 1.8833f, 1.9281f, 1.8837f, 1.9163f, 1.8105f, 1.0081f, 1.0f,
+    1.4851f, 1.5033f, 2.4154f, 1.5378f, 1.5431f, 1.04f,   1.0493f};
+
+constexpr const char* kFactorDomain = "VirtualNormalizationFactors";
 
 HidEventRef createGestureEvent(std::uint32_t eventMask, PixelRegion region)
 {
@@ -26,15 +43,262 @@ HidEventRef withPhase(HidEventRef event, std::uint16_t phase)
     return event;
 }
 
+// Appends C printf output, so that the dumps match the C library's formatting exactly.
+__attribute__((format(printf, 2, 3))) void appendFormat(std::string& out, const char* format, ...)
+{
+    char buffer[256];
+    va_list args;
+    va_start(args, format);
+    va_list retry;
+    va_copy(retry, args);
+    const int needed = std::vsnprintf(buffer, sizeof buffer, format, args);
+    va_end(args);
+    if (needed >= 0 && static_cast<std::size_t>(needed) < sizeof buffer) {
+        out.append(buffer, static_cast<std::size_t>(needed));
+    } else if (needed >= 0) {
+        std::string large(static_cast<std::size_t>(needed) + 1, '\0');
+        std::vsnprintf(large.data(), large.size(), format, retry);
+        out.append(large.data(), static_cast<std::size_t>(needed));
+    }
+    va_end(retry);
+}
+
+const char* onMark(const Pixel& pixel) { return pixel.active ? "<==ON" : ""; }
+
+// Index after the factor domain and its dot, read as a stream reads an
+// unsigned number: blanks skipped, digits up to the first other character,
+// and 0 when nothing can be read.
+bool factorIndexFromKey(const std::string& key, std::size_t& index)
+{
+    std::string rest = key;
+    if (!Util::stripDomainFromKey(rest, kFactorDomain)) return false;
+    std::istringstream stream(rest);
+    unsigned long value = 0;
+    stream >> value;
+    index = value;
+    return true;
+}
+
 }  // namespace
 
-HidEventList Algs::handleImage(const InputReport::Image&) { return {}; }
+Algs::Algs()
+{
+    pixels.reserve(kPadGains.size());
+    for (std::size_t pad = 0; pad < kPadGains.size(); ++pad) pixels.emplace_back(static_cast<int>(pad), kPadGains[pad]);
+    virtualPixels.reserve(virtualImage.groups.size());
+    for (std::size_t group = 0; group < virtualImage.groups.size(); ++group) {
+        virtualPixels.emplace_back(virtualImage.groups[group], virtualImage.normalizationFactors[group]);
+    }
+}
 
-HidEventList Algs::handleReset() { return {}; }
+HidEventList Algs::handleImage(const InputReport::Image& image)
+{
+    HidEventList events;
+    processTouchFrame(image.readings, image.frameNumber, image.timeMs, events);
+    return events;
+}
 
-PropertyValue Algs::getState(const std::string&) { return PropertyValue::null(); }
+HidEventList Algs::handleReset()
+{
+    // A reset device reads nothing: running one empty frame releases a touch
+    // in progress through the ordinary rules.
+    HidEventList events;
+    processTouchFrame(Readings{}, 0, 0, events);
+    return events;
+}
 
-void Algs::setState(const std::string&, PropertyValue) {}
+void Algs::processTouchFrame(const Readings& readings, unsigned int frameNumber, unsigned int timeMs,
+                             HidEventList& events)
+{
+    updatePixels(readings);
+    virtualImage.updateValues(pixels);
+    updateVirtualPixels();
+    handStats.updateHandState(pixels, virtualPixels, timeMs);
+
+    const EventDecision decision = decideEvent();
+    if (decision.resetsTouch) Reset();
+    if (decision.event) emitEvent(decision.event, frameNumber, events);
+
+    eventStats.update(handStats);
+    if (log.isEnabled(LogLevel::Debug)) writeDumps(readings, frameNumber, timeMs);
+}
+
+void Algs::updatePixels(const Readings& readings)
+{
+    for (std::size_t pad = 0; pad < readings.size(); ++pad) {
+        pixels.at(pad).updatePixelState(readings[pad], handStats.activationThreshold);
+    }
+}
+
+void Algs::updateVirtualPixels()
+{
+    for (std::size_t group = 0; group < virtualImage.groups.size(); ++group) {
+        // The group sum travels as a pad reading would: a signed 16-bit number.
+        const auto raw = static_cast<std::int16_t>(virtualImage.values.at(group));
+        virtualPixels.at(group).updatePixelState(raw, handStats.activationThreshold, virtualImage.maxIndex.at(group));
+    }
+}
+
+// The first row that holds decides; every region is the touch's active region.
+Algs::EventDecision Algs::decideEvent() const
+{
+    const HandStats& hand = handStats;
+    const PixelRegion region = hand.activeRegion;
+    const bool touchBegins = hand.touching && !hand.wasTouching;
+    const bool touchEnds = !hand.touching && hand.wasTouching;
+
+    if (touchBegins) return {createMayBeginEvent(region), false};
+    if (hand.holding && !hand.wasHolding) return {createHoldStartEvent(region), false};
+    if (hand.holding && hand.wasHolding && hand.activeRegion != hand.previousActiveRegion) {
+        return {createHoldChangeEvent(region), false};
+    }
+    if (hand.wasHolding && !hand.holding) return {createHoldEndEvent(region), true};
+    if (hand.tapAccepted) return {createTapEvent(region), true};
+    if (touchEnds && lastEventPhase == HidEvent::kPhaseMayBegin) return {createCancelEvent(), true};
+    if (touchEnds) return {nullptr, true};
+    return {nullptr, false};
+}
+
+void Algs::emitEvent(const HidEventRef& event, unsigned int frameNumber, HidEventList& events)
+{
+    event->setIntegerValue(kFrameNumberField, frameNumber);
+    lastEventPhase = event->phase();
+    events.push_back(event);
+}
+
+void Algs::Reset()
+{
+    for (Pixel& pixel : pixels) pixel.resetGlobalStats();
+    for (VirtualPixel& pixel : virtualPixels) pixel.resetGlobalStats();
+    handStats.Reset();
+}
+
+void Algs::writeDumps(const Readings& readings, unsigned int frameNumber, unsigned int timeMs) const
+{
+    if (log.isEnabled(LogLevel::Debug)) {
+        log.debug("Frame %u @%ums, *** Event Stats ***\n%@", frameNumber, timeMs, eventStats.statsDictionary());
+    }
+    if (log.isEnabled(LogLevel::Debug)) {
+        log.debug("Frame %u @%ums, *** Touch State Description ***\n%@", frameNumber, timeMs,
+                  touchStateDescription(readings, timeMs));
+    }
+    if (log.isEnabled(LogLevel::Debug)) {
+        log.debug("Frame %u @%ums, *** Virtual State Description ***\n%@", frameNumber, timeMs,
+                  virtualStateDescription(readings, timeMs));
+    }
+}
+
+PropertyValue Algs::getState(const std::string& key)
+{
+    if (key == "EnableHoldSuppression") return PropertyValue::boolean(handStats.enableHoldSuppression);
+    if (key == "EnableTapSuppression") return PropertyValue::boolean(handStats.enableTapSuppression);
+    if (key == "HoldTimeoutMilliseconds") return PropertyValue::uint32(handStats.holdTimeoutMs);
+    if (key == "ActivationThreshold") return PropertyValue::float32(handStats.activationThreshold);
+    if (std::size_t index = 0; factorIndexFromKey(key, index)) {
+        if (index >= virtualImage.normalizationFactors.size()) return PropertyValue::null();
+        return PropertyValue::float32(virtualImage.normalizationFactors[index]);
+    }
+    if (key == "EventStats") return eventStats.statsDictionary();
+    if (key == "DebugInfo") {
+        VeltoHost::PropertyDictionary info;
+        info.set("EventStats", eventStats.statsDictionary());
+        return PropertyValue::dictionary(std::move(info));
+    }
+    return PropertyValue::null();
+}
+
+void Algs::setState(const std::string& key, PropertyValue value)
+{
+    // Values that are not numbers count as 0 and nothing is range-checked:
+    // the host is trusted to tune within reason.
+    if (key == "EnableHoldSuppression") {
+        handStats.enableHoldSuppression = value.toBool();
+    } else if (key == "EnableTapSuppression") {
+        handStats.enableTapSuppression = value.toBool();
+    } else if (key == "HoldTimeoutMilliseconds") {
+        handStats.holdTimeoutMs = static_cast<std::uint32_t>(value.toUInt64());
+    } else if (key == "ActivationThreshold") {
+        handStats.activationThreshold = value.toFloat();
+    } else if (key == "ResetEventStats") {
+        eventStats.Reset();
+    } else if (std::size_t index = 0; factorIndexFromKey(key, index)) {
+        // Only the table changes: the virtual pixels keep the gains they were
+        // built with.
+        if (index < virtualImage.normalizationFactors.size()) virtualImage.normalizationFactors[index] = value.toFloat();
+    }
+}
+
+std::string Algs::handFeaturesText() const
+{
+    const HandStats& hand = handStats;
+    std::string text;
+    appendFormat(text, "ts=%f, sd=%f, tsd=%f, NonActivePixels=%d, TimeDurationRatio=%f, TapSVMScore=%f, ",
+                 static_cast<double>(hand.touchScore), static_cast<double>(hand.signalPerDuration),
+                 static_cast<double>(hand.signalPerTouchDuration), hand.nonActivePixels,
+                 static_cast<double>(hand.timeDurationRatio), static_cast<double>(hand.tapSVMScore));
+    return text;
+}
+
+std::string Algs::touchStateDescription(const Readings& readings, unsigned int timeMs) const
+{
+    std::string text = handFeaturesText();
+    text += '[';
+    for (std::size_t pad = 0; pad < InputReport::kPadCount; ++pad) {
+        const Pixel& pixel = pixels.at(pad);
+        if (pad > 0) text += ", ";
+        appendFormat(text, "%c=%4d %4d%s", 'A' + pixel.index, readings[pad], pixel.value, onMark(pixel));
+    }
+    text += "] ";
+    text += stateText(timeMs);
+    return text;
+}
+
+std::string Algs::virtualStateDescription(const Readings& /*readings*/, unsigned int timeMs) const
+{
+    std::string text = handFeaturesText();
+    text += '[';
+    for (std::size_t group = 0; group < VirtualImage::kGroupCount; ++group) {
+        const VirtualPixel& pixel = virtualPixels.at(group);
+        if (group > 0) text += ", ";
+        appendFormat(text, "%s=%4d%s", pixel.name.c_str(), pixel.value, onMark(pixel));
+    }
+    text += "] ";
+    text += stateText(timeMs);
+    return text;
+}
+
+// One word for the phase of the touch in this frame; the first row that holds decides.
+std::string Algs::stateText(unsigned int timeMs) const
+{
+    const HandStats& hand = handStats;
+    // Differences wrap in 32 bits and print as signed numbers.
+    const auto sinceStart = static_cast<std::int32_t>(timeMs - hand.touchStartTime);
+    const auto duration = static_cast<std::int32_t>(hand.touchEndTime - hand.touchStartTime);
+    const int region = static_cast<int>(hand.activeRegion);
+    const char* noise = hand.aboveNoise ? "ABOVENOISE" : "BELOWNOISE";
+
+    std::string text;
+    if (hand.touching && !hand.wasTouching) {
+        appendFormat(text, "STARTTOUCH %dms ActiveRegion=%d", sinceStart, region);
+    } else if (hand.holding && hand.wasHolding) {
+        appendFormat(text, "HOLDING %dms ActiveRegion=%d", sinceStart, region);
+    } else if (hand.holding) {
+        appendFormat(text, "STARTHOLD %dms ActiveRegion=%d", sinceStart, region);
+    } else if (hand.holdSuppressed) {
+        appendFormat(text, "SUPPRESSHOLD %dms ActiveRegion=%d", sinceStart, region);
+    } else if (hand.touching) {
+        appendFormat(text, "TOUCHING %dms ActiveRegion=%d", sinceStart, region);
+    } else if (hand.wasHolding) {
+        appendFormat(text, "ENDHOLD %dms ActiveRegion=%d %s", duration, region, noise);
+    } else if (hand.tapAccepted) {
+        appendFormat(text, "TAP %dms ActiveRegion=%d %s", duration, region, noise);
+    } else if (hand.tapCandidate) {
+        appendFormat(text, "SUPPRESSTAP %dms ActiveRegion=%d %s", sinceStart, region, noise);
+    } else if (hand.wasTouching) {
+        appendFormat(text, "ENDTOUCH %dms ActiveRegion=%d %s", duration, region, noise);
+    }
+    return text;
+}
 
 HidEventRef Algs::createMayBeginEvent(PixelRegion region)
 {

@@ -1,11 +1,20 @@
 #pragma once
 
+#include "algs/EventStats.h"
+#include "algs/HandStats.h"
+#include "algs/Pixel.h"
 #include "algs/PixelRegion.h"
+#include "algs/VirtualImage.h"
+#include "algs/VirtualPixel.h"
 #include "pipeline/InputReport.h"
 #include "platform/HidEvent.h"
+#include "platform/Log.h"
 #include "platform/PropertyValue.h"
 
+#include <array>
+#include <cstdint>
 #include <string>
+#include <vector>
 
 namespace VeltoTouch {
 
@@ -17,12 +26,23 @@ public:
     // Integer field of every emitted event that carries its frame number.
     static constexpr std::uint32_t kFrameNumberField = 0x000B001B;
 
+    using Readings = std::array<std::int16_t, InputReport::kPadCount>;
+
+    Algs();
+
     VeltoHost::HidEventList handleImage(const InputReport::Image& image);
     // One frame of all-zero readings with frame number 0 and time 0.
     VeltoHost::HidEventList handleReset();
+    void processTouchFrame(const Readings& readings, unsigned int frameNumber, unsigned int timeMs,
+                           VeltoHost::HidEventList& events);
+    // Forgets the statistics of the touch that has just ended.
+    void Reset();
 
     PropertyValue getState(const std::string& key);
     void setState(const std::string& key, PropertyValue value);
+
+    std::string touchStateDescription(const Readings& readings, unsigned int timeMs) const;
+    std::string virtualStateDescription(const Readings& readings, unsigned int timeMs) const;
 
     static VeltoHost::HidEventRef createMayBeginEvent(PixelRegion region);
     static VeltoHost::HidEventRef createHoldStartEvent(PixelRegion region);
@@ -30,6 +50,30 @@ public:
     static VeltoHost::HidEventRef createHoldEndEvent(PixelRegion region);
     static VeltoHost::HidEventRef createTapEvent(PixelRegion region);
     static VeltoHost::HidEventRef createCancelEvent();
+
+    VeltoHost::Log log{"Algs"};
+    std::vector<Pixel> pixels;
+    VirtualImage virtualImage;
+    std::vector<VirtualPixel> virtualPixels;
+    HandStats handStats;
+    EventStats eventStats;
+    std::uint16_t lastEventPhase = 0;
+
+private:
+    // What the event decision table says for one frame.
+    struct EventDecision {
+        VeltoHost::HidEventRef event;
+        bool resetsTouch = false;
+    };
+
+    void updatePixels(const Readings& readings);
+    void updateVirtualPixels();
+    EventDecision decideEvent() const;
+    void emitEvent(const VeltoHost::HidEventRef& event, unsigned int frameNumber, VeltoHost::HidEventList& events);
+    void writeDumps(const Readings& readings, unsigned int frameNumber, unsigned int timeMs) const;
+
+    std::string stateText(unsigned int timeMs) const;
+    std::string handFeaturesText() const;
 };
 
 }  // namespace VeltoTouch

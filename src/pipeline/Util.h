@@ -1,5 +1,6 @@
 #pragma once
 
+#include "pipeline/InputReport.h"
 #include "platform/MonotonicClock.h"
 
 #include <cstdint>
@@ -30,5 +31,14 @@ std::string hexStringFromBytes(const std::uint8_t* bytes, std::size_t length);
 // number. Throws std::invalid_argument("invalid hex string") for a number of
 // 256 or more.
 std::vector<std::uint8_t> bytesFromHexString(const std::string& text);
+
+}  // namespace VeltoTouch::Util
+
+namespace VeltoTouch::Util {
+
+// Draws one image report over the pad layout: each pad's number (its level
+// when useLevels is set, else its reading) in place of its letters, under a
+// header line with the frame number and time.
+std::string stringFromImage(const InputReport::Image& image, bool useLevels);
 
 }  // namespace VeltoTouch::Util

@@ -1,0 +1,56 @@
+#include "algs/VirtualImage.h"
+
+#include <array>
+#include <string_view>
+
+namespace VeltoTouch {
+
+namespace {
+
+// Pad letters of each group, in group order; the hand statistics address
+// "IJK" (18) and "KLM" (19) by position.
+constexpr std::array<std::string_view, VirtualImage::kGroupCount> kGroupNames = {
+    "ABE", "ABF", "ADEF", "AEGJ", "BCEF", "BFHJ", "CDE", "CDF", "CELN", "DFLO", "EFK", "EJK",
+    "EKL", "FJK", "FKL",  "GHI",  "GIJ",  "HIJ",  "IJK", "KLM", "LMN",  "LMO",  "MNO"};
+
+// Gain of each group's virtual pixel, roughly the inverse of how many of its
+// pads a typical fingertip covers.
+constexpr std::array<float, VirtualImage::kGroupCount> kNormalizationFactors = {
+    0.6667f, 0.4444f, 0.6667f, 0.5714f, 0.6667f, 0.5714f, 0.6667f, 0.4651f, 0.6667f, 0.6667f, 0.4f, 0.4f,
+    0.4f,    0.4f,    0.4f,    0.5714f, 0.4f,    0.4f,    0.4f,    0.4f,    0.4444f, 0.5714f, 0.6667f};
+
+int padIndexOfLetter(char letter) { return letter - 'A'; }
+
+}  // namespace
+
+VirtualImage::VirtualImage()
+{
+    groups.assign(kGroupNames.begin(), kGroupNames.end());
+    values.reserve(kGroupCount);
+    maxIndex.reserve(kGroupCount);
+    normalizationFactors.reserve(kGroupCount);
+    for (std::size_t j = 0; j < kGroupCount; ++j) {
+        maxIndex.push_back(padIndexOfLetter(groups[j].front()));
+        values.push_back(0);
+        normalizationFactors.push_back(kNormalizationFactors[j]);
+    }
+}
+
+void VirtualImage::updateValues(const std::vector<Pixel>& pixels)
+{
+    values.assign(values.size(), 0);
+    for (std::size_t j = 0; j < groups.size(); ++j) {
+        for (char letter : groups[j]) {
+            const int pad = padIndexOfLetter(letter);
+            const std::int32_t padValue = pixels.at(static_cast<std::size_t>(pad)).value;
+            if (padValue <= Pixel::kNoiseLevel) continue;
+            values.at(j) += padValue;
+            // The first strongest member wins a tie, and the one already
+            // recorded keeps it, so the index does not flicker between equals.
+            std::int32_t& strongest = maxIndex.at(j);
+            if (padValue > pixels.at(static_cast<std::size_t>(strongest)).value) strongest = pad;
+        }
+    }
+}
+
+}  // namespace VeltoTouch

@@ -1,0 +1,30 @@
+#pragma once
+
+#include "algs/Pixel.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace VeltoTouch {
+
+// Sums of fixed groups of neighbouring pads: a contact between pads, or a
+// broad one such as a palm, shows up as a strong group where every single pad
+// is weak. Each sum feeds one VirtualPixel kept by the recogniser.
+class VirtualImage {
+public:
+    static constexpr std::size_t kGroupCount = 23;
+
+    VirtualImage();
+
+    // Recomputes the group sums and strongest members from this frame's pads.
+    void updateValues(const std::vector<Pixel>& pixels);
+
+    std::vector<std::int32_t> values;
+    std::vector<std::string> groups;
+    std::vector<std::int32_t> maxIndex;
+    std::vector<float> normalizationFactors;
+};
+
+}  // namespace VeltoTouch
