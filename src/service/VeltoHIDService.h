@@ -1,0 +1,60 @@
+#pragma once
+
+#include "platform/PluginInterface.h"
+#include "platform/PropertyValue.h"
+#include "platform/SerialQueue.h"
+
+#include <atomic>
+#include <cstdint>
+
+namespace VeltoTouch {
+
+// Base of a HID service plug-in object: owns the two function tables through
+// which the host talks to it and the object's reference count. The host holds
+// the address of `_pluginInterface` or `_serviceInterface` as its interface
+// pointer; the tables' reserved word leads back to this object.
+//
+// Every operation has a refusing default, so a service overrides only what it
+// supports. Objects live on the heap and are destroyed by the last release.
+class VeltoHIDService {
+public:
+    VeltoHIDService();
+    virtual ~VeltoHIDService();
+
+    VeltoHIDService(const VeltoHIDService&) = delete;
+    VeltoHIDService& operator=(const VeltoHIDService&) = delete;
+
+    VeltoHost::VeltoInterfaceRef getPluginInterface() noexcept;
+    VeltoHost::VeltoInterfaceRef getServiceInterface() noexcept;
+
+    // Reference counting shared by both interfaces. A new object holds one
+    // reference, its creator's. Both return the count after the change;
+    // release destroys the object when the count reaches 0.
+    std::uint32_t addRef() noexcept;
+    std::uint32_t release() noexcept;
+
+    virtual VeltoHost::VeltoStatus probeWithService(std::uint32_t service, const VeltoHost::PropertyValue& properties,
+                                                    std::int32_t* outScore);
+    virtual VeltoHost::VeltoStatus startWithService(std::uint32_t service, const VeltoHost::PropertyValue& properties);
+    virtual VeltoHost::VeltoStatus stop();
+    virtual bool openWithOptions(std::uint32_t options);
+    virtual void closeWithOptions(std::uint32_t options);
+    // An empty reference stands for null. `key` may be null.
+    virtual VeltoHost::PropertyValue getPropertyForKey(const char* key);
+    virtual bool setProperty(const VeltoHost::PropertyValue& value, const char* key);
+    virtual void setEventCallback(VeltoHost::VeltoEventCallback callback, void* target, void* refcon);
+    virtual void scheduleWithDispatchQueue(const VeltoHost::SerialQueue::Ref& queue);
+    virtual void unscheduleWithDispatchQueue(const VeltoHost::SerialQueue::Ref& queue);
+    virtual VeltoHost::HidEventRef copyEventWithType(std::uint32_t type, VeltoHost::HidEvent* matching,
+                                                     std::uint32_t options);
+    virtual VeltoHost::VeltoStatus setOutputEvent(VeltoHost::HidEvent* event);
+
+private:
+    // The host dereferences these members' addresses, so they stay plain
+    // pointers to tables that never move.
+    VeltoHost::PluginInterfaceTable* _pluginInterface;
+    VeltoHost::ServiceInterfaceTable* _serviceInterface;
+    std::atomic<std::uint32_t> _refCount{1};
+};
+
+}  // namespace VeltoTouch
