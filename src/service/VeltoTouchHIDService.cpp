@@ -47,12 +47,10 @@ void dispatchEvents(const VeltoTouchHIDService::DispatchEventInfo& info, const H
     if (batch.empty()) return;
     log.debug("Dispatch %ju event(s) takeoff", batch.size());
     if (!info.queue) return;
-    // The job does not keep the queue alive itself: a queue runs the jobs
-    // still queued when it is destroyed, and a job holding the last reference
-    // would make the queue's worker destroy (and join) itself.
-    VeltoTouchHIDService::DispatchEventInfo jobInfo = info;
-    jobInfo.queue = nullptr;
-    info.queue->async([jobInfo, batch = std::move(batch), log] { deliverEvents(jobInfo, batch, log); });
+    // The job owns its events and its own reference to the queue, so batches
+    // still queued deliver after the thread has ended and the service has
+    // dropped the queue.
+    info.queue->async([info, batch = std::move(batch), log] { deliverEvents(info, batch, log); });
 }
 
 std::uint64_t reportByte(const std::uint8_t* report, std::size_t length, std::size_t index)
@@ -145,13 +143,15 @@ void VeltoTouchHIDService::scheduleWithDispatchQueue(const SerialQueue::Ref& que
     // that it never reads members the host thread may change meanwhile.
     Semaphore::Ref signal = _inputReportThreadSignal;
     HostDevice::Ref device = _veltoDevice;
-    Thread::startDetached([this, info, device, signal] { runInputReportThread(info, device, signal); },
-                          "VeltoInputReport");
+    Thread::startDetached(
+        [this, info, device, signal]() mutable {
+            runInputReportThread(std::move(info), std::move(device), std::move(signal));
+        },
+        "VeltoInputReport");
     signal->wait();
 }
 
-void VeltoTouchHIDService::runInputReportThread(const DispatchEventInfo& info, const HostDevice::Ref& device,
-                                                const Semaphore::Ref& signal)
+void VeltoTouchHIDService::runInputReportThread(DispatchEventInfo info, HostDevice::Ref device, Semaphore::Ref signal)
 {
     // The service may be destroyed as soon as the second signal is seen, so
     // the last line goes through a copy of the log handle.
@@ -159,12 +159,14 @@ void VeltoTouchHIDService::runInputReportThread(const DispatchEventInfo& info, c
     log.debug("input report thread start");
     _inputReportRunLoop = RunLoop::current();
     signal->signal();
-    handleInputReports(info, device);
+    // The thread's references to the queue and the device go with the call,
+    // before unscheduling hears that the thread is done.
+    handleInputReports(std::move(info), std::move(device));
     signal->signal();
     log.debug("input report thread end");
 }
 
-void VeltoTouchHIDService::handleInputReports(const DispatchEventInfo& info, const HostDevice::Ref& device)
+void VeltoTouchHIDService::handleInputReports(DispatchEventInfo info, HostDevice::Ref device)
 {
     if (int error = Thread::setCurrentScheduling(kInputReportThreadPolicy, kInputReportThreadPriority)) {
         _log.error("pthread_setschedparam failed: %d", error);

@@ -78,9 +78,9 @@ private:
                                               const std::uint8_t* report, std::size_t reportLength,
                                               std::uint64_t timeStamp)>;
 
-    void runInputReportThread(const DispatchEventInfo& info, const VeltoHost::HostDevice::Ref& device,
-                              const VeltoHost::Semaphore::Ref& signal);
-    void handleInputReports(const DispatchEventInfo& info, const VeltoHost::HostDevice::Ref& device);
+    void runInputReportThread(DispatchEventInfo info, VeltoHost::HostDevice::Ref device,
+                              VeltoHost::Semaphore::Ref signal);
+    void handleInputReports(DispatchEventInfo info, VeltoHost::HostDevice::Ref device);
     void handleInputReport(const std::uint8_t* report, std::size_t reportLength);
     void installPipelineProbes(const DispatchEventInfo& info);
     void clearPipelineProbes();
