@@ -1,0 +1,57 @@
+#include "DumpCommand.h"
+
+#include "ToolError.h"
+#include "ToolFiles.h"
+#include "pipeline/InputReport.h"
+#include "pipeline/Util.h"
+#include "recording/PipelineRecording.h"
+
+#include <charconv>
+
+namespace VeltoTool {
+
+namespace {
+
+std::uint32_t parseFrameNumber(const std::string& text, const std::string& range)
+{
+    std::uint32_t value = 0;
+    auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), value);
+    if (error != std::errc() || end != text.data() + text.size()) {
+        throw ToolError("invalid frame range \"" + range + "\" (expected A:B with frame numbers)");
+    }
+    return value;
+}
+
+}  // namespace
+
+DumpCommand::FrameRange DumpCommand::parseRange(const std::string& text)
+{
+    FrameRange range;
+    if (text.empty()) return range;
+    const auto colon = text.find(':');
+    if (colon == std::string::npos) {
+        range.first = range.last = parseFrameNumber(text, text);
+        return range;
+    }
+    const std::string first = text.substr(0, colon);
+    const std::string last = text.substr(colon + 1);
+    if (!first.empty()) range.first = parseFrameNumber(first, text);
+    if (!last.empty()) range.last = parseFrameNumber(last, text);
+    if (range.first > range.last) throw ToolError("invalid frame range \"" + text + "\" (first frame after last)");
+    return range;
+}
+
+void DumpCommand::run(const Options& options, std::ostream& out)
+{
+    const FrameRange range = parseRange(options.frames);
+    const std::string text = ToolFiles::read(options.file);
+    VeltoTouch::PipelineRecording recording{std::string_view(text)};
+    for (const auto& frame : recording.frames()) {
+        if (frame.type != VeltoTouch::PipelineRecording::Frame::Type::InputReport) continue;
+        auto image = VeltoTouch::InputReport::Image::parse(frame.report.data(), frame.report.size());
+        if (!image || !range.contains(image->frameNumber)) continue;
+        out << VeltoTouch::Util::stringFromImage(*image, options.levels) << '\n';
+    }
+}
+
+}  // namespace VeltoTool

@@ -1,0 +1,33 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <ostream>
+#include <string>
+
+namespace VeltoTool {
+
+// `veltotouch dump FILE`: draws the pad readings of each Image report of a
+// recording over the pad layout.
+class DumpCommand {
+public:
+    struct Options {
+        std::string file;
+        // Inclusive range of image frame numbers, "A:B", "A:" or ":B"; empty is every frame.
+        std::string frames;
+        // Draw the levels instead of the readings.
+        bool levels = false;
+    };
+
+    static void run(const Options& options, std::ostream& out);
+
+    struct FrameRange {
+        std::uint32_t first = 0;
+        std::uint32_t last = UINT32_MAX;
+        bool contains(std::uint32_t frame) const noexcept { return frame >= first && frame <= last; }
+    };
+    // Throws ToolError for text that is not a range.
+    static FrameRange parseRange(const std::string& text);
+};
+
+}  // namespace VeltoTool

@@ -1,0 +1,39 @@
+#pragma once
+
+#include "algs/PixelRegion.h"
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace VeltoTool {
+
+// A small language for synthetic gestures, one step per statement, statements
+// separated by ';' or new lines, '#' starting a comment:
+//   tap REGION [DURATION]        a short touch (default 120ms)
+//   hold REGION DURATION         a long touch in one place
+//   slide FROM TO DURATION       a touch that moves from one region to another
+//   palm DURATION                a large flat contact over most of the surface
+//   idle DURATION                no touch
+//   noise DURATION               no touch, with heavy sensor noise
+//   reset                        the device reports that it has reset
+// REGION is top, middle or bottom; DURATION a number with ms or s ("600ms", "1.2s").
+class GestureScript {
+public:
+    enum class Action { Tap, Hold, Slide, Palm, Idle, Noise, Reset };
+
+    struct Step {
+        Action action;
+        VeltoTouch::PixelRegion from = VeltoTouch::PixelRegion::None;
+        VeltoTouch::PixelRegion to = VeltoTouch::PixelRegion::None;
+        std::uint32_t durationMs = 0;
+        int line = 0;  // 1-based, for messages
+    };
+
+    // Throws ToolError with the statement's line and what was wrong.
+    static std::vector<Step> parse(const std::string& text);
+
+    static std::uint32_t parseDuration(const std::string& text);  // throws ToolError
+};
+
+}  // namespace VeltoTool

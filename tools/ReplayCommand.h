@@ -1,0 +1,32 @@
+#pragma once
+
+#include <ostream>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace VeltoTool {
+
+// `veltotouch replay FILE`: plays a recording through a fresh pipeline and
+// prints the gestures it produces.
+class ReplayCommand {
+public:
+    struct Options {
+        std::string file;
+        // 0 plays as fast as possible; otherwise paced like the recording, this many times faster.
+        float speed = 0;
+        // Pipeline state applied before the first frame: key relative to the
+        // pipeline ("Algs.HoldTimeoutMilliseconds") and a JSON value.
+        std::vector<std::pair<std::string, std::string>> settings;
+        // Pipeline state read after the last frame.
+        std::vector<std::string> reads;
+        bool dump = false;
+        bool jsonLines = false;
+    };
+
+    // Writes events (and dumps) to `out`. Throws ToolError or the recording's
+    // own errors.
+    static void run(const Options& options, std::ostream& out);
+};
+
+}  // namespace VeltoTool

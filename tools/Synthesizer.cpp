@@ -1,0 +1,114 @@
+#include "Synthesizer.h"
+
+#include <algorithm>
+
+namespace VeltoTool {
+
+using Action = GestureScript::Action;
+using VeltoTouch::PipelineRecording;
+
+namespace {
+
+// Recording time stamps are the host clock's; any origin will do.
+constexpr std::uint64_t kRecordingOriginNs = 1'000'000'000;
+
+}  // namespace
+
+Synthesizer::Synthesizer(std::uint32_t framePeriodMs, std::uint32_t seed)
+    : _framePeriodMs(std::max<std::uint32_t>(framePeriodMs, 1)), _model(seed)
+{
+}
+
+std::uint32_t Synthesizer::frameCount(std::uint32_t durationMs) const
+{
+    return (durationMs + _framePeriodMs / 2) / _framePeriodMs;
+}
+
+PipelineRecording Synthesizer::synthesize(const std::vector<GestureScript::Step>& steps)
+{
+    idle(kLeadInMs, kSensorNoise);
+    for (const GestureScript::Step& step : steps) {
+        switch (step.action) {
+        case Action::Idle: idle(step.durationMs, kSensorNoise); break;
+        case Action::Noise: idle(step.durationMs, kHeavyNoise); break;
+        case Action::Reset: resetReport(); break;
+        case Action::Tap:
+        case Action::Hold:
+        case Action::Slide:
+        case Action::Palm:
+            touch(step);
+            idle(kReleaseGapMs, kSensorNoise);
+            break;
+        }
+    }
+    return std::move(_recording);
+}
+
+void Synthesizer::idle(std::uint32_t durationMs, double noise)
+{
+    for (std::uint32_t i = 0, n = frameCount(durationMs); i < n; ++i) {
+        appendImage(_model.read(ContactModel::Contact{}, noise));
+    }
+}
+
+void Synthesizer::touch(const GestureScript::Step& step)
+{
+    const std::uint32_t frames = std::max<std::uint32_t>(frameCount(step.durationMs), 1);
+    const std::uint32_t rise = std::max<std::uint32_t>(frameCount(kRiseMs), 1);
+    const std::uint32_t fall = std::max<std::uint32_t>(frameCount(kFallMs), 1);
+    const ContactModel::Point from = ContactModel::regionCentre(step.from);
+    const ContactModel::Point to = ContactModel::regionCentre(step.to);
+    for (std::uint32_t i = 0; i < frames; ++i) {
+        // Pressure ramps up at the start and down at the end of the touch.
+        const double pressure = std::min({1.0, (i + 1.0) / rise, (frames - i) / static_cast<double>(fall)});
+        ContactModel::Contact contact;
+        if (step.action == Action::Palm) {
+            contact = ContactModel::palm(pressure);
+        } else {
+            const double progress = frames > 1 ? static_cast<double>(i) / (frames - 1) : 0.0;
+            const ContactModel::Point centre{from.x + (to.x - from.x) * progress, from.y + (to.y - from.y) * progress};
+            contact = ContactModel::finger(centre, pressure);
+        }
+        appendImage(_model.read(contact, kSensorNoise));
+    }
+}
+
+void Synthesizer::resetReport()
+{
+    // The firmware's reset notice: event code 0 and no context.
+    appendReport({0x02, 0x00, 0, 0, 0, 0, 0, 0, 0, 0});
+}
+
+void Synthesizer::appendImage(const ContactModel::Readings& readings)
+{
+    std::vector<std::uint8_t> report(73, 0);
+    report[0] = 0x01;
+    for (int i = 0; i < 4; ++i) {
+        report[1 + i] = static_cast<std::uint8_t>(_frameNumber >> (8 * i));
+        report[5 + i] = static_cast<std::uint8_t>(_timeMs >> (8 * i));
+    }
+    for (std::size_t pad = 0; pad < readings.size(); ++pad) {
+        // Levels carry the raw magnitude; only the dump shows them.
+        const auto level = static_cast<std::uint16_t>(std::abs(static_cast<int>(readings[pad])));
+        const auto reading = static_cast<std::uint16_t>(readings[pad]);
+        report[13 + 2 * pad] = static_cast<std::uint8_t>(level);
+        report[14 + 2 * pad] = static_cast<std::uint8_t>(level >> 8);
+        report[43 + 2 * pad] = static_cast<std::uint8_t>(reading);
+        report[44 + 2 * pad] = static_cast<std::uint8_t>(reading >> 8);
+    }
+    appendReport(std::move(report));
+    ++_frameNumber;
+    _timeMs += _framePeriodMs;
+}
+
+void Synthesizer::appendReport(std::vector<std::uint8_t> report)
+{
+    PipelineRecording::Frame frame;
+    frame.type = PipelineRecording::Frame::Type::InputReport;
+    // A reset notice arrives between two frames; it takes the time of the last one.
+    frame.timestampNs = kRecordingOriginNs + static_cast<std::uint64_t>(_timeMs - 1000) * 1'000'000u;
+    frame.report = std::move(report);
+    _recording.appendFrame(std::move(frame));
+}
+
+}  // namespace VeltoTool
