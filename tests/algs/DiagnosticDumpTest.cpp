@@ -1,0 +1,107 @@
+// The diagnostic texts, to the character.
+#include "algs/FrameBuilder.h"
+#include "pipeline/Util.h"
+#include "platform/CaptureLogSink.h"
+
+#include <gtest/gtest.h>
+
+namespace VeltoTouch::Test {
+namespace {
+
+using VeltoHost::CaptureLogSink;
+using VeltoHost::LogLevel;
+
+std::vector<std::string> lines(const std::string& text)
+{
+    std::vector<std::string> result;
+    std::size_t start = 0;
+    for (std::size_t end; (end = text.find('\n', start)) != std::string::npos; start = end + 1) {
+        result.push_back(text.substr(start, end - start));
+    }
+    result.push_back(text.substr(start));
+    return result;
+}
+
+std::string blanks(std::size_t n) { return std::string(n, ' '); }
+
+TEST(StringFromImage, DrawsEachPadsNumberOverTheLayout)
+{
+    InputReport::Image image;
+    image.frameNumber = 7;
+    image.timeMs = 1234;
+    std::vector<std::string> drawn = lines(Util::stringFromImage(image, false));
+    ASSERT_EQ(drawn.size(), 16u);  // header, empty line, 13 rows, and nothing after the last "\n"
+    EXPECT_EQ(drawn[0], "# Image frame 7    time 1234 ms");
+    EXPECT_EQ(drawn[1], "");
+    EXPECT_EQ(drawn[2], blanks(12) + "0" + blanks(8) + "0" + blanks(12));
+    EXPECT_EQ(drawn[7], blanks(2) + "0" + blanks(28) + "0" + blanks(2));  // A and B at the sides
+    EXPECT_EQ(drawn[15], "");
+
+    image.readings[7] = 5;     // H
+    image.readings[6] = -123;  // G
+    image.readings[8] = 12345; // I
+    image.levels[6] = 65535;
+    drawn = lines(Util::stringFromImage(image, false));
+    EXPECT_EQ(drawn[2], blanks(12) + "5" + blanks(7) + "-123" + blanks(10));
+    EXPECT_EQ(drawn[3], blanks(16) + "12345" + blanks(16));
+    drawn = lines(Util::stringFromImage(image, true));
+    EXPECT_EQ(drawn[2], blanks(12) + "0" + blanks(7) + "65535" + blanks(11));
+}
+
+TEST(StateDescriptions, PadsGroupsAndThePhaseOfTheTouch)
+{
+    PipelineHarness harness;
+    harness.builder = FrameBuilder(1, 970);
+    harness.idle(3);
+    harness.press({{'K', 248}, {'A', 12}}, 1);  // starts at 1000
+    const Algs& algs = harness.algs();
+    Algs::Readings readings{};
+    readings[0] = 12;
+    readings[10] = 248;
+    std::string touch = algs.touchStateDescription(readings, 1000);
+    EXPECT_NE(touch.find(", K= 248  599<==ON, "), std::string::npos) << touch;
+    EXPECT_EQ(touch.rfind("[A=  12   23, B=   0    0, ", std::string::npos), touch.find('[')) << touch;
+    EXPECT_EQ(touch.substr(touch.find(']')), "] STARTTOUCH 0ms ActiveRegion=1") << touch;
+    EXPECT_EQ(touch.rfind("ts=", 0), 0u);
+    EXPECT_NE(touch.find(", NonActivePixels=21, "), std::string::npos) << touch;
+
+    const std::string groups = algs.virtualStateDescription(readings, 1000);
+    EXPECT_NE(groups.find("[ABE=   0, ABF=   0, "), std::string::npos) << groups;
+    EXPECT_NE(groups.find(", IJK= 239<==ON, KLM= 239<==ON, "), std::string::npos) << groups;
+    EXPECT_NE(groups.find(", MNO=   0] STARTTOUCH"), std::string::npos) << groups;
+
+    harness.press({{'K', 248}}, 17);
+    harness.release();  // at 1180
+    EXPECT_EQ(lines(algs.touchStateDescription(readings, 1180)).size(), 1u);
+    const std::string tap = algs.touchStateDescription(readings, 1180);
+    EXPECT_EQ(tap.substr(tap.find(']')), "] TAP 180ms ActiveRegion=1 BELOWNOISE");
+    EXPECT_NE(tap.find(", K= 248    0, "), std::string::npos);  // the reading given, the value of the frame
+
+    harness.idle(100);
+    const std::string quiet = algs.touchStateDescription(readings, 2200);
+    EXPECT_EQ(quiet.substr(quiet.size() - 2), "] ");
+}
+
+TEST(StateDescriptions, WrittenToTheDebugLogEveryFrameOnlyWhenEnabled)
+{
+    PipelineHarness harness;
+    {
+        CaptureLogSink::Scope capture(LogLevel::Default);
+        harness.idle(2);
+        EXPECT_TRUE(capture.sink().messages("Algs").empty());
+    }
+    CaptureLogSink::Scope capture(LogLevel::Debug);
+    harness.press({{'K', 300}}, 1);  // frame 3 at 1020 ms
+    const std::vector<std::string> messages = capture.sink().messages("Algs");
+    ASSERT_EQ(messages.size(), 3u);
+    EXPECT_EQ(messages[0].rfind("Frame 3 @1020ms, *** Event Stats ***\n", 0), 0u) << messages[0];
+    EXPECT_NE(messages[0].find("numTaps"), std::string::npos);
+    EXPECT_EQ(messages[1], "Frame 3 @1020ms, *** Touch State Description ***\n" +
+                               harness.algs().touchStateDescription(Algs::Readings{0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 300},
+                                                                    1020));
+    EXPECT_EQ(messages[2].rfind("Frame 3 @1020ms, *** Virtual State Description ***\nts=", 0), 0u);
+    EXPECT_NE(messages[2].find("STARTTOUCH 0ms ActiveRegion=1"), std::string::npos);
+}
+
+}  // namespace
+}  // namespace VeltoTouch::Test
