@@ -1,0 +1,204 @@
+#include "RecordingTestSupport.h"
+
+#include "pipeline/Util.h"
+#include "platform/MonotonicClock.h"
+
+#include <gtest/gtest.h>
+
+#include <memory>
+#include <sstream>
+#include <string>
+
+namespace {
+
+using namespace RecordingTestSupport;
+using VeltoHost::MonotonicClock;
+
+// Frames written compactly, oldest first: "Sa1" is a state frame of key a
+// with value 1, "R1" an input report whose single byte is 1.
+PipelineRecording::FrameList framesFrom(const std::string& notation)
+{
+    PipelineRecording::FrameList frames;
+    std::istringstream words(notation);
+    std::string word;
+    while (words >> word) {
+        if (word[0] == 'S') {
+            frames.push_back(stateFrame(0, word.substr(1, 1), PropertyValue::uint64(std::stoull(word.substr(2)))));
+        } else {
+            frames.push_back(reportFrame(0, {static_cast<std::uint8_t>(std::stoul(word.substr(1)))}));
+        }
+    }
+    return frames;
+}
+
+std::string notationOf(const PipelineRecording::FrameList& frames)
+{
+    std::string text;
+    for (const Frame& frame : frames) {
+        if (!text.empty()) text += ' ';
+        if (frame.type == Frame::Type::State) {
+            text += "S" + frame.key + std::to_string(frame.value.toUInt64());
+        } else {
+            text += "R" + std::to_string(frame.report.at(0));
+        }
+    }
+    return text;
+}
+
+TEST(RecordingTrim, KeepsNewestReportsAndTheStateThatStillMatters)
+{
+    struct Row {
+        const char* frames;
+        std::uint64_t limit;
+        const char* result;
+    };
+    const Row rows[] = {
+        {"Sa1 R1 Sa2 Sa3 R2 R3", 2, "Sa3 R2 R3"},
+        {"Sb1 R1 Sa1 R2", 1, "Sb1 Sa1 R2"},
+        {"Sa1 R1 Sa2 R2 Sa3 R3", 2, "Sa2 R2 Sa3 R3"},
+        {"Sa1 Sa2 Sb1", 5, "Sa2 Sb1"},
+        {"R1 R2 R3", 5, "R1 R2 R3"},
+        // State after the newest report is kept per key as well.
+        {"R1 Sa1 Sb1 Sa2", 1, "R1 Sb1 Sa2"},
+        // Once the limit is reached, older frames of any key seen since the
+        // oldest kept report go, even across dropped reports.
+        {"Sa1 R1 Sb1 R2 Sa2 R3", 1, "Sb1 Sa2 R3"},
+    };
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.frames);
+        PipelineRecording::FrameList frames = framesFrom(row.frames);
+        PipelineRecording::trimFrames(frames, row.limit);
+        EXPECT_EQ(notationOf(frames), row.result);
+    }
+}
+
+TEST(RecordingTrim, AppendingTrimsWhenTheListReachesTwiceTheLimit)
+{
+    PipelineRecording recording;
+    recording.setMaxFrameCount(1350);
+    recording.setState("Algs.Mode", PropertyValue::uint64(1));
+    recording.setState("Algs.Mode", PropertyValue::uint64(2));
+    std::uint32_t frameNumber = 0;
+    while (recording.frames().size() < 2699) {
+        const auto report = imageReport(++frameNumber, 0);
+        recording.handleInputReport(report.data(), report.size());
+    }
+    ASSERT_EQ(recording.frames().size(), 2699u) << "2699 frames are not trimmed";
+
+    const auto last = imageReport(++frameNumber, 0);
+    recording.handleInputReport(last.data(), last.size());
+    // 2698 reports: the 1350 newest stay, with the newer Mode before them.
+    ASSERT_EQ(recording.frames().size(), 1351u);
+    EXPECT_EQ(recording.frames().front().key, "Algs.Mode");
+    EXPECT_EQ(recording.frames().front().value, PropertyValue::uint64(2));
+    EXPECT_EQ(std::next(recording.frames().begin())->report, imageReport(frameNumber - 1349, 0));
+    EXPECT_EQ(recording.frames().back().report, last);
+
+    PipelineRecording unlimited;
+    for (int i = 0; i < 3000; ++i) unlimited.handleInputReport(last.data(), last.size());
+    EXPECT_EQ(unlimited.frames().size(), 3000u);
+}
+
+TEST(RecordingTrim, SettingALimitTrimsAtOnceAndZeroRemovesIt)
+{
+    PipelineRecording recording;
+    for (std::uint8_t i = 1; i <= 10; ++i) recording.appendFrame(reportFrame(i, {i}));
+    recording.setMaxFrameCount(3);
+    EXPECT_EQ(notationOf(recording.frames()), "R8 R9 R10");
+    recording.setMaxFrameCount(0);
+    EXPECT_EQ(notationOf(recording.frames()), "R8 R9 R10");
+    for (std::uint8_t i = 11; i <= 20; ++i) recording.appendFrame(reportFrame(i, {i}));
+    EXPECT_EQ(recording.frames().size(), 13u);
+}
+
+TEST(Recorder, RecordsEachCallWithOneClockReadingAndForwardsIt)
+{
+    auto log = std::make_shared<CallLog>();
+    PipelineRecording recording;
+    recording.pipeline = log;
+
+    const PropertyValue value = PropertyValue::string("shared");
+    const std::uint64_t before = MonotonicClock::now();
+    recording.setState("Algs.Key", value);
+    recording.setState("Algs.Empty", PropertyValue());
+    const auto image = imageReport(1, 2);
+    recording.handleInputReport(image.data(), image.size());
+    recording.handleInputReport(nullptr, 0);
+    recording.setTime(123456);
+    const std::uint64_t after = MonotonicClock::now();
+
+    EXPECT_EQ(log->calls, (std::vector<std::string>{"time", "state Algs.Key", "time", "state Algs.Empty", "time",
+                                                    "report 73", "time", "report 0"}))
+        << "setTime on the recorder forwards nothing";
+    ASSERT_EQ(recording.frames().size(), 4u);
+    std::size_t i = 0;
+    for (const Frame& frame : recording.frames()) {
+        EXPECT_EQ(frame.timestampNs, VeltoTouch::Util::nanosecondsFromMachTime(log->times[i]))
+            << "frame " << i << " and the forwarded time come from one reading";
+        EXPECT_GE(log->times[i], before);
+        EXPECT_LE(log->times[i], after);
+        if (i > 0) {
+            EXPECT_GE(log->times[i], log->times[i - 1]);
+        }
+        ++i;
+    }
+
+    const Frame& state = recording.frames().front();
+    EXPECT_EQ(state.type, Frame::Type::State);
+    EXPECT_EQ(state.value.identity(), value.identity()) << "the value is shared, not copied";
+    EXPECT_EQ(log->values[0].identity(), value.identity());
+    EXPECT_FALSE(std::next(recording.frames().begin())->value.hasValue());
+    EXPECT_FALSE(log->values[1].hasValue());
+    EXPECT_EQ(std::next(recording.frames().begin(), 2)->report, image);
+    EXPECT_EQ(log->reports[0], image);
+    EXPECT_TRUE(recording.frames().back().report.empty());
+    EXPECT_EQ(recording.frames().back().type, Frame::Type::InputReport);
+}
+
+TEST(Recorder, WithoutAWrappedInputStillRecords)
+{
+    PipelineRecording recording;
+    const auto image = imageReport(1, 2);
+    recording.handleInputReport(image.data(), image.size());
+    recording.setState("k", PropertyValue::null());
+    EXPECT_EQ(recording.frames().size(), 2u);
+}
+
+TEST(Recorder, CopiesShareInputAndValuesButOwnTheirFramesAndNoCursor)
+{
+    auto log = std::make_shared<CallLog>();
+    PipelineRecording original;
+    original.pipeline = log;
+    original.setMaxFrameCount(7);
+    original.setState("k", PropertyValue::string("v"));
+    const auto image = imageReport(1, 2);
+    original.handleInputReport(image.data(), image.size());
+    original.playReset();
+    ASSERT_TRUE(original.playCanContinue());
+
+    PipelineRecording copy(original);
+    PipelineRecording assigned;
+    assigned.appendFrame(reportFrame(1, {9}));
+    assigned.playReset();
+    assigned = original;
+    for (PipelineRecording* duplicate : {&copy, &assigned}) {
+        EXPECT_EQ(duplicate->pipeline, log);
+        EXPECT_EQ(duplicate->maxFrameCount(), 7u);
+        ASSERT_EQ(duplicate->frames().size(), 2u);
+        EXPECT_EQ(duplicate->frames().front().value.identity(), original.frames().front().value.identity());
+        EXPECT_EQ(duplicate->frames().back().report, image);
+        EXPECT_FALSE(duplicate->playCanContinue()) << "a copy's cursor is not valid";
+        EXPECT_THROW(duplicate->playNextFrame(1.0f), std::runtime_error);
+    }
+
+    copy.handleInputReport(image.data(), image.size());
+    EXPECT_EQ(copy.frames().size(), 3u);
+    EXPECT_EQ(original.frames().size(), 2u) << "the copy has its own list";
+    EXPECT_TRUE(original.playCanContinue()) << "the original's cursor is untouched by the copies";
+
+    PipelineRecording moved(std::move(copy));
+    EXPECT_EQ(moved.frames().size(), 3u);
+    EXPECT_FALSE(moved.playCanContinue());
+}
+
+}  // namespace

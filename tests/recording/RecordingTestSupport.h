@@ -1,0 +1,90 @@
+#pragma once
+
+#include "pipeline/PipelineInput.h"
+#include "recording/PipelineRecording.h"
+
+#include <array>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+// Helpers shared by the recording tests.
+namespace RecordingTestSupport {
+
+using VeltoTouch::PipelineRecording;
+using VeltoTouch::PropertyValue;
+using Frame = PipelineRecording::Frame;
+
+// Raw image report: ID 0x01, 73 bytes, frame number and time little-endian.
+inline std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs,
+                                             const std::array<std::int16_t, 15>& readings = {})
+{
+    std::vector<std::uint8_t> bytes(73, 0);
+    bytes[0] = 0x01;
+    for (int i = 0; i < 4; ++i) {
+        bytes[1 + i] = static_cast<std::uint8_t>(frameNumber >> (8 * i));
+        bytes[5 + i] = static_cast<std::uint8_t>(timeMs >> (8 * i));
+    }
+    for (int pad = 0; pad < 15; ++pad) {
+        auto value = static_cast<std::uint16_t>(readings[pad]);
+        bytes[43 + 2 * pad] = static_cast<std::uint8_t>(value);
+        bytes[44 + 2 * pad] = static_cast<std::uint8_t>(value >> 8);
+    }
+    return bytes;
+}
+
+// Firmware event report: ID 0x02, event code, 8 context bytes. Code 0 is a
+// device reset.
+inline std::vector<std::uint8_t> firmwareEventReport(std::uint8_t code)
+{
+    std::vector<std::uint8_t> bytes{0x02, code};
+    bytes.resize(10, 0xA5);
+    return bytes;
+}
+
+inline Frame stateFrame(std::uint64_t timestampNs, std::string key, PropertyValue value)
+{
+    Frame frame;
+    frame.type = Frame::Type::State;
+    frame.timestampNs = timestampNs;
+    frame.key = std::move(key);
+    frame.value = std::move(value);
+    return frame;
+}
+
+inline Frame reportFrame(std::uint64_t timestampNs, std::vector<std::uint8_t> bytes)
+{
+    Frame frame;
+    frame.type = Frame::Type::InputReport;
+    frame.timestampNs = timestampNs;
+    frame.report = std::move(bytes);
+    return frame;
+}
+
+// A PipelineInput that remembers every call, in order, as text, plus the
+// times and values it was given.
+class CallLog final : public VeltoTouch::PipelineInput {
+public:
+    void setTime(std::uint64_t time) override
+    {
+        times.push_back(time);
+        calls.push_back("time");
+    }
+    void setState(const std::string& key, PropertyValue value) override
+    {
+        values.push_back(value);
+        calls.push_back("state " + key);
+    }
+    void handleInputReport(const std::uint8_t* data, std::size_t length) override
+    {
+        reports.emplace_back(data, data + length);
+        calls.push_back("report " + std::to_string(length));
+    }
+
+    std::vector<std::string> calls;
+    std::vector<std::uint64_t> times;
+    std::vector<PropertyValue> values;
+    std::vector<std::vector<std::uint8_t>> reports;
+};
+
+}  // namespace RecordingTestSupport
