@@ -43,7 +43,9 @@ void expectCount(const std::vector<std::string>& w, std::size_t min, std::size_t
 GestureScript::Step parseStatement(const std::vector<std::string>& w, int line)
 {
     using Action = GestureScript::Action;
-    GestureScript::Step step{Action::Idle, PixelRegion::None, PixelRegion::None, 0, line};
+    GestureScript::Step step;
+    step.action = Action::Idle;
+    step.line = line;
     auto duration = [&](const std::string& text) {
         try {
             return GestureScript::parseDuration(text);
@@ -58,10 +60,15 @@ GestureScript::Step parseStatement(const std::vector<std::string>& w, int line)
         step.from = step.to = parseRegion(w[1], line);
         step.durationMs = w.size() == 3 ? duration(w[2]) : kDefaultTapMs;
     } else if (verb == "hold") {
-        expectCount(w, 3, 3, line, "hold REGION DURATION");
+        expectCount(w, 3, 4, line, "hold REGION DURATION [reset@TIME]");
         step.action = Action::Hold;
         step.from = step.to = parseRegion(w[1], line);
         step.durationMs = duration(w[2]);
+        if (w.size() == 4) {
+            if (w[3].rfind("reset@", 0) != 0) fail(line, "expected \"reset@TIME\" after the duration, got \"" + w[3] + "\"");
+            step.resetAtMs = duration(w[3].substr(6));
+            if (*step.resetAtMs >= step.durationMs) fail(line, "reset@ must fall within the hold");
+        }
     } else if (verb == "slide") {
         expectCount(w, 4, 4, line, "slide FROM TO DURATION");
         step.action = Action::Slide;

@@ -3,6 +3,7 @@
 #include "algs/PixelRegion.h"
 
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -11,7 +12,9 @@ namespace VeltoTool {
 // A small language for synthetic gestures, one step per statement, statements
 // separated by ';' or new lines, '#' starting a comment:
 //   tap REGION [DURATION]        a short touch (default 120ms)
-//   hold REGION DURATION         a long touch in one place
+//   hold REGION DURATION [reset@TIME]
+//                                a long touch in one place; with reset@TIME the
+//                                device reports a reset TIME into the touch
 //   slide FROM TO DURATION       a touch that moves from one region to another
 //   palm DURATION                a large flat contact over most of the surface
 //   idle DURATION                no touch
@@ -23,10 +26,12 @@ public:
     enum class Action { Tap, Hold, Slide, Palm, Idle, Noise, Reset };
 
     struct Step {
-        Action action;
+        Action action = Action::Idle;
         VeltoTouch::PixelRegion from = VeltoTouch::PixelRegion::None;
         VeltoTouch::PixelRegion to = VeltoTouch::PixelRegion::None;
         std::uint32_t durationMs = 0;
+        // Hold only: when the device reports a reset during the touch.
+        std::optional<std::uint32_t> resetAtMs;
         int line = 0;  // 1-based, for messages
     };
 

@@ -58,7 +58,10 @@ void Synthesizer::touch(const GestureScript::Step& step)
     const std::uint32_t fall = std::max<std::uint32_t>(frameCount(kFallMs), 1);
     const ContactModel::Point from = ContactModel::regionCentre(step.from);
     const ContactModel::Point to = ContactModel::regionCentre(step.to);
+    constexpr std::uint32_t kNoReset = UINT32_MAX;
+    const std::uint32_t resetFrame = step.resetAtMs ? frameCount(*step.resetAtMs) : kNoReset;
     for (std::uint32_t i = 0; i < frames; ++i) {
+        if (resetFrame == i) resetReport();
         // Pressure ramps up at the start and down at the end of the touch.
         const double pressure = std::min({1.0, (i + 1.0) / rise, (frames - i) / static_cast<double>(fall)});
         ContactModel::Contact contact;

@@ -1,0 +1,231 @@
+#include "Cli.h"
+#include "GestureScript.h"
+#include "SynthCommand.h"
+#include "ToolError.h"
+
+#include <gtest/gtest.h>
+#include <nlohmann/json.hpp>
+
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+namespace fs = std::filesystem;
+using namespace VeltoTool;
+
+namespace {
+
+struct ToolRun {
+    int status;
+    std::string out;
+    std::string err;
+};
+
+ToolRun runTool(std::vector<std::string> arguments)
+{
+    arguments.insert(arguments.begin(), "veltotouch");
+    std::vector<const char*> argv;
+    for (const std::string& argument : arguments) argv.push_back(argument.c_str());
+    std::ostringstream out, err;
+    int status = Cli::run(static_cast<int>(argv.size()), argv.data(), out, err);
+    return {status, out.str(), err.str()};
+}
+
+std::string readFile(const fs::path& path)
+{
+    std::ifstream in(path);
+    std::ostringstream text;
+    text << in.rdbuf();
+    return text.str();
+}
+
+class TempDir {
+public:
+    TempDir() : _path(fs::temp_directory_path() / ("veltotouch-test-" + std::to_string(::getpid())))
+    {
+        fs::create_directories(_path);
+    }
+    ~TempDir() { fs::remove_all(_path); }
+    fs::path file(const std::string& name, const std::string& text = {}) const
+    {
+        fs::path path = _path / name;
+        if (!text.empty()) std::ofstream(path) << text;
+        return path;
+    }
+
+private:
+    fs::path _path;
+};
+
+// Gesture names of a replay, one per event.
+std::vector<std::string> gesturesOf(const std::string& script)
+{
+    TempDir dir;
+    fs::path recording = dir.file("synth.json");
+    std::ofstream(recording) << SynthCommand::containerFor(script, 10, 7);
+    ToolRun run = runTool({"replay", recording.string(), "--jsonl"});
+    EXPECT_EQ(run.status, 0) << run.err;
+    std::vector<std::string> out;
+    std::istringstream lines(run.out);
+    for (std::string line; std::getline(lines, line);) {
+        auto json = nlohmann::json::parse(line);
+        std::string gesture = json["gesture"];
+        if (json.contains("region")) gesture += "/" + json["region"].get<std::string>();
+        out.push_back(gesture);
+    }
+    return out;
+}
+
+}  // namespace
+
+TEST(Tool, ReplayOfEveryExampleMatchesItsExpectedEvents)
+{
+    int examples = 0;
+    for (const auto& entry : fs::directory_iterator(VELTO_EXAMPLES_DIR)) {
+        if (entry.path().extension() != ".json") continue;
+        fs::path expected = entry.path();
+        expected.replace_extension(".expected");
+        ASSERT_TRUE(fs::exists(expected)) << expected;
+        ToolRun run = runTool({"replay", entry.path().string()});
+        EXPECT_EQ(run.status, 0) << run.err;
+        EXPECT_EQ(run.out, readFile(expected)) << entry.path();
+        ++examples;
+    }
+    EXPECT_GE(examples, 5);
+}
+
+TEST(Tool, JsonLinesCarryTheEventFieldsAndStateReads)
+{
+    ToolRun run = runTool({"replay", std::string(VELTO_EXAMPLES_DIR) + "/reset-mid-hold.json", "--jsonl", "--get",
+                       "Algs.EventStats", "--get", "DebugInfo"});
+    ASSERT_EQ(run.status, 0) << run.err;
+    std::vector<nlohmann::json> lines;
+    std::istringstream text(run.out);
+    for (std::string line; std::getline(text, line);) lines.push_back(nlohmann::json::parse(line));
+    ASSERT_GE(lines.size(), 6u);
+
+    const auto& first = lines[0];
+    EXPECT_EQ(first["gesture"], "may-begin");
+    EXPECT_EQ(first["region"], "middle");
+    EXPECT_EQ(first["phase"], 128);
+    EXPECT_EQ(first["eventMask"], 0);
+    EXPECT_EQ(first["y"], 1);
+    EXPECT_TRUE(first["frame"].is_number_unsigned());
+    EXPECT_TRUE(first["timestamp"].is_number_unsigned());
+
+    // The hold ends with frame 0 in the reset frame, followed by the vendor event.
+    auto reset = std::find_if(lines.begin(), lines.end(), [](const auto& l) { return l["gesture"] == "device-reset"; });
+    ASSERT_NE(reset, lines.end());
+    EXPECT_EQ((*reset)["usagePage"], 65376);
+    EXPECT_EQ((*reset)["usage"], 2);
+    EXPECT_EQ((*(reset - 1))["gesture"], "hold-end");
+    EXPECT_EQ((*(reset - 1))["frame"], 0);
+    EXPECT_EQ((*(reset - 1))["eventMask"], 2);
+
+    const auto& stats = lines[lines.size() - 2];
+    EXPECT_EQ(stats["key"], "Algs.EventStats");
+    EXPECT_TRUE(stats["value"]["Dispatched"]["numTaps"].is_number());
+    EXPECT_EQ(lines.back()["key"], "DebugInfo");
+    EXPECT_EQ(lines.back()["value"]["ResetCount"], 1);
+}
+
+TEST(Tool, SettingsApplyBeforeTheFirstFrame)
+{
+    // With a hold timeout longer than every touch, the holds example holds nothing.
+    ToolRun run = runTool({"replay", std::string(VELTO_EXAMPLES_DIR) + "/holds.json", "--set",
+                       "Algs.HoldTimeoutMilliseconds=5000", "--get", "Algs.HoldTimeoutMilliseconds"});
+    ASSERT_EQ(run.status, 0) << run.err;
+    EXPECT_EQ(run.out.find("hold-start"), std::string::npos);
+    EXPECT_NE(run.out.find("Algs.HoldTimeoutMilliseconds = 5000"), std::string::npos);
+
+    ToolRun bad = runTool({"replay", std::string(VELTO_EXAMPLES_DIR) + "/holds.json", "--set", "NoEquals"});
+    EXPECT_EQ(bad.status, 1);
+    EXPECT_NE(bad.err.find("expected KEY=VALUE"), std::string::npos);
+}
+
+TEST(Tool, SynthesisedGesturesAreRecognisedAsMeant)
+{
+    using V = std::vector<std::string>;
+    EXPECT_EQ(gesturesOf("tap top"), (V{"may-begin/top", "tap/top"}));
+    EXPECT_EQ(gesturesOf("tap bottom 80ms"), (V{"may-begin/bottom", "tap/bottom"}));
+    EXPECT_EQ(gesturesOf("hold middle 1s"), (V{"may-begin/middle", "hold-start/middle", "hold-end/middle"}));
+    EXPECT_EQ(gesturesOf("palm 1.5s"), (V{"may-begin/middle", "cancel/none"}));
+    V slide = gesturesOf("slide top bottom 900ms");
+    ASSERT_GE(slide.size(), 4u);
+    EXPECT_EQ(slide.front(), "may-begin/top");
+    EXPECT_EQ(std::count(slide.begin(), slide.end(), "hold-change/bottom"), 1);
+    EXPECT_EQ(slide.back(), "hold-end/bottom");
+}
+
+TEST(Tool, ScriptErrorsNameTheLineAndTheProblem)
+{
+    auto message = [](const std::string& script) {
+        try {
+            GestureScript::parse(script);
+        } catch (const ToolError& error) {
+            return std::string(error.what());
+        }
+        return std::string("no error");
+    };
+    EXPECT_EQ(message("tap left"), "script line 1: unknown region \"left\" (top, middle or bottom)");
+    EXPECT_EQ(message("tap top\nwave 2s"),
+              "script line 2: unknown gesture \"wave\" (tap, hold, slide, palm, idle, noise, reset)");
+    EXPECT_EQ(message("idle 5"), "script line 1: invalid duration \"5\" (for example 600ms or 1.2s)");
+    EXPECT_EQ(message("hold top"), "script line 1: expected \"hold REGION DURATION [reset@TIME]\"");
+    EXPECT_EQ(message("hold top 1s reset@2s"), "script line 1: reset@ must fall within the hold");
+    EXPECT_EQ(message("# comment only\n\n tap top ; idle 1.5s # trailing"), "no error");
+    EXPECT_EQ(GestureScript::parse("idle 1.5s; idle 20ms")[0].durationMs, 1500u);
+}
+
+TEST(Tool, MalformedFilesAndUsageErrorsExitNonZeroWithOneLine)
+{
+    TempDir dir;
+    struct Case {
+        std::string content;
+        std::string message;
+    };
+    const Case cases[] = {
+        {"not json", "veltotouch: migrateSerializedContainer failed: invalid container\n"},
+        {R"({"Version": 2})", "veltotouch: migrateSerializedContainer failed: invalid container version: 2\n"},
+        {R"({"Version": 1})", "veltotouch: invalid frames\n"},
+        {R"({"Version": 1, "Frames": [{"Type": "InputReport", "Timestamp": 1, "Report": "100"}]})",
+         "veltotouch: invalid hex string\n"},
+    };
+    for (const Case& c : cases) {
+        fs::path file = dir.file("bad.json", c.content);
+        for (const char* command : {"replay", "dump"}) {
+            ToolRun run = runTool({command, file.string()});
+            EXPECT_EQ(run.status, 1) << c.content;
+            EXPECT_EQ(run.err, c.message) << command;
+        }
+    }
+    ToolRun missing = runTool({"replay", (dir.file("absent.json")).string()});
+    EXPECT_EQ(missing.status, 1);
+    EXPECT_NE(missing.err.find("No such file"), std::string::npos);
+
+    EXPECT_EQ(runTool({}).status, 2);
+    EXPECT_EQ(runTool({"replay"}).status, 2);
+    EXPECT_EQ(runTool({"frobnicate"}).status, 2);
+    EXPECT_EQ(runTool({"synth", "tap top"}).status, 2);  // -o is required
+    ToolRun help = runTool({"replay", "--help"});
+    EXPECT_EQ(help.status, 0);
+    EXPECT_NE(help.out.find("--jsonl"), std::string::npos);
+}
+
+TEST(Tool, DumpDrawsTheChosenFrames)
+{
+    const std::string file = std::string(VELTO_EXAMPLES_DIR) + "/taps.json";
+    ToolRun run = runTool({"dump", file, "--frames", "25:26"});
+    ASSERT_EQ(run.status, 0) << run.err;
+    EXPECT_EQ(run.out.rfind("# Image frame 25    time 1240 ms\n\n", 0), 0u);
+    EXPECT_NE(run.out.find("# Image frame 26    time 1250 ms"), std::string::npos);
+    EXPECT_EQ(run.out.find("# Image frame 27"), std::string::npos);
+    // 2 headers, 2 blank lines after them, 13 rows each, a blank line after each drawing.
+    EXPECT_EQ(std::count(run.out.begin(), run.out.end(), '\n'), 2 * (2 + 13 + 1));
+
+    EXPECT_EQ(runTool({"dump", file, "--frames", "9:3"}).status, 1);
+    EXPECT_EQ(runTool({"dump", file, "--frames", "x"}).err,
+              "veltotouch: invalid frame range \"x\" (expected A:B with frame numbers)\n");
+}
