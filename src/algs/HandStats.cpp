@@ -97,7 +97,8 @@ HandStats::FrameScan HandStats::scanFrame(const std::vector<Pixel>& pixels,
 
 void HandStats::scanElement(const Pixel& element, FrameScan& scan, float& strongestRatio)
 {
-    const float ratio = std::fmax(element.ratio, 0.0f);
+    // Negative ratios (and one that is not a number) count as 0.
+    const float ratio = element.ratio > 0.0f ? element.ratio : 0.0f;
     if (element.active) {
         if (ratio > maxActiveRatio) {
             maxActiveRatio = ratio;

@@ -1,7 +1,6 @@
 #include "algs/Pixel.h"
 
 #include <algorithm>
-#include <cmath>
 
 namespace VeltoTouch {
 
@@ -22,9 +21,9 @@ void Pixel::updatePixelState(int raw, float activationThreshold)
     // A pad that is on stays on until it falls well below its peak; a pad that
     // is off must climb well above its lowest level since release. Together
     // these ride out slow baseline drift without chattering at the threshold.
-    // fmax also turns a floor quotient that is not a number into 1.0.
-    const double threshold = active ? peakRatio * kHysteresis
-                                    : std::fmax(floorRatio / static_cast<float>(kHysteresis), 1.0);
+    // A floor quotient that is not a number leaves the threshold at 1.0.
+    const double reactivation = floorRatio / static_cast<float>(kHysteresis);
+    const double threshold = active ? peakRatio * kHysteresis : (reactivation > 1.0 ? reactivation : 1.0);
 
     ratio = static_cast<float>(value) / activationThreshold;
     active = ratio > threshold;

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <functional>
+#include <utility>
 
 namespace VeltoTouch {
 
@@ -34,6 +35,22 @@ constexpr RankTable kWeights = {
 // Offset of the decision function.
 constexpr float kBias = 2.0083f;
 
+// The largest and second largest of at least two values.
+std::pair<std::int32_t, std::int32_t> twoLargest(const std::int32_t* values, std::size_t count)
+{
+    std::int32_t first = std::max(values[0], values[1]);
+    std::int32_t second = std::min(values[0], values[1]);
+    for (std::size_t i = 2; i < count; ++i) {
+        if (values[i] > first) {
+            second = first;
+            first = values[i];
+        } else if (values[i] > second) {
+            second = values[i];
+        }
+    }
+    return {first, second};
+}
+
 }  // namespace
 
 SVM::SVM() : means(kMeans), scales(kScales), weights(kWeights), bias(kBias) {}
@@ -54,11 +71,14 @@ void SVM::updateSVMScore(const std::vector<Pixel>& pixels, const std::vector<Vir
         if (count < kRankCount) profile[count++] = pixel.value;
     }
     if (count < 2) return;
-    std::sort(profile.begin(), profile.begin() + static_cast<std::ptrdiff_t>(count), std::greater<>());
 
     // Nothing on the surface worth judging: no element past the activation
-    // level and fewer than two above noise.
-    if (!(static_cast<float>(profile[0]) > activationThreshold) && profile[1] <= Pixel::kNoiseLevel) return;
+    // level and fewer than two above noise. Most frames are idle, so this is
+    // decided from the two largest values before anything is sorted.
+    const auto [largest, secondLargest] = twoLargest(profile.data(), count);
+    if (!(static_cast<float>(largest) > activationThreshold) && secondLargest <= Pixel::kNoiseLevel) return;
+
+    std::sort(profile.begin(), profile.begin() + static_cast<std::ptrdiff_t>(count), std::greater<>());
 
     for (std::size_t rank = 0; rank < count; ++rank) {
         const float standardised = (static_cast<float>(profile[rank]) - means[rank]) / scales[rank];
