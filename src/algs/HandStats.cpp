@@ -19,7 +19,7 @@ constexpr float kTimeBiasMax = 1.0f;
 // (a finger lifting as it slides), the larger the jump the new region needs.
 constexpr float kSwitchDropStart = 0.2f;
 constexpr float kSwitchDropEnd = 0.5f;
-constexpr float kSwitchFactorMin = 1.3f;
+constexpr float kSwitchFactorMin = HandStats::kRegionSwitchFactorDefault;
 constexpr float kSwitchFactorMax = 5.0f;
 
 // Share of the centre pad K that the "KLM" or "IJK" group must reach for a

@@ -45,46 +45,20 @@ FrameBuilder::FrameBuilder(std::uint32_t firstFrameNumber, std::uint32_t startTi
 {
 }
 
-void FrameBuilder::setReading(char padLetter, std::int16_t reading)
-{
-    _readings.at(static_cast<std::size_t>(pad(padLetter))) = reading;
-}
-
-void FrameBuilder::setLevel(char padLetter, std::uint16_t level)
-{
-    _levels.at(static_cast<std::size_t>(pad(padLetter))) = level;
-}
-
 void FrameBuilder::setContact(const Contact& contact)
 {
     _readings.fill(0);
-    for (const auto& [letter, reading] : contact) setReading(letter, reading);
-}
-
-void FrameBuilder::clear()
-{
-    _readings.fill(0);
-    _levels.fill(0);
-}
-
-std::vector<std::uint8_t> FrameBuilder::report() const
-{
-    std::vector<std::uint8_t> bytes(InputReport::Image::kLength, 0);
-    bytes[0] = InputReport::Image::kReportID;
-    putU32(bytes, 1, _frameNumber);
-    putU32(bytes, 5, _timeMs);
-    for (std::size_t i = 0; i < 15; ++i) {
-        putU16(bytes, 13 + 2 * i, _levels[i]);
-        putU16(bytes, 43 + 2 * i, static_cast<std::uint16_t>(_readings[i]));
-    }
-    return bytes;
+    for (const auto& [letter, reading] : contact) _readings.at(static_cast<std::size_t>(pad(letter))) = reading;
 }
 
 std::vector<std::uint8_t> FrameBuilder::next()
 {
-    std::vector<std::uint8_t> bytes = report();
-    ++_frameNumber;
+    std::vector<std::uint8_t> bytes(InputReport::Image::kLength, 0);
+    bytes[0] = InputReport::Image::kReportID;
+    putU32(bytes, 1, _frameNumber++);
+    putU32(bytes, 5, _timeMs);
     _timeMs += _intervalMs;
+    for (std::size_t i = 0; i < _readings.size(); ++i) putU16(bytes, 43 + 2 * i, static_cast<std::uint16_t>(_readings[i]));
     return bytes;
 }
 
@@ -108,7 +82,7 @@ void PipelineHarness::frames(int n)
 
 void PipelineHarness::idle(int n)
 {
-    builder.clear();
+    builder.setContact({});
     frames(n);
 }
 

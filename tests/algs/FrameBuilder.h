@@ -18,27 +18,17 @@ constexpr int pad(char letter) { return letter - 'A'; }
 // The pads of a contact and the raw reading each one sees.
 using Contact = std::vector<std::pair<char, std::int16_t>>;
 
-// Builds 73-byte Image reports frame by frame: the current readings and
-// levels, a frame number that rises by one and a time that advances by the
+// Builds 73-byte Image reports frame by frame: the current contact's
+// readings, a frame number that rises by one and a time that advances by the
 // frame interval with each frame taken.
 class FrameBuilder {
 public:
     explicit FrameBuilder(std::uint32_t firstFrameNumber = 1, std::uint32_t startTimeMs = 1000,
                           std::uint32_t intervalMs = 10);
 
-    void setReading(char padLetter, std::int16_t reading);
-    void setLevel(char padLetter, std::uint16_t level);
     void setContact(const Contact& contact);  // these readings, every other pad 0
-    void clear();                             // every reading and level 0
-
-    // The report of the current frame, without advancing.
-    std::vector<std::uint8_t> report() const;
-    // The report of the current frame; then the next frame comes one interval later.
+    // The report of the current frame; the next frame comes one interval later.
     std::vector<std::uint8_t> next();
-    void skipTime(std::uint32_t ms) { _timeMs += ms; }
-
-    std::uint32_t frameNumber() const { return _frameNumber; }
-    std::uint32_t timeMs() const { return _timeMs; }
     std::uint32_t intervalMs() const { return _intervalMs; }
 
 private:
@@ -46,7 +36,6 @@ private:
     std::uint32_t _timeMs;
     std::uint32_t _intervalMs;
     std::array<std::int16_t, 15> _readings{};
-    std::array<std::uint16_t, 15> _levels{};
 };
 
 // A real pipeline fed by a FrameBuilder, collecting every event it emits.
