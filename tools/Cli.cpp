@@ -31,7 +31,7 @@ int Cli::main(int argc, char** argv) { return run(argc, argv, std::cout, std::ce
 
 int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream& err)
 {
-    CLI::App app{"veltotouch: replay, synthesise, inspect and host VeltoTouch recordings"};
+    CLI::App app{"veltotouch: replay, synthesise, inspect and host VeltoTouch recordings", "veltotouch"};
     app.require_subcommand(1);
 
     ReplayCommand::Options replay;
@@ -72,7 +72,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     try {
         app.parse(argc, argv);
     } catch (const CLI::CallForHelp&) {
-        out << app.help() ;
+        out << app.help();
         return 0;
     } catch (const CLI::CallForAllHelp&) {
         out << app.help("", CLI::AppFormatMode::All);
