@@ -39,6 +39,34 @@ constexpr std::string_view kReportDataKey = "ReportData";
 
 [[noreturn]] void reject(const char* message) { throw std::invalid_argument(message); }
 
+int hexDigit(char c)
+{
+    if (c >= '0' && c <= '9') return c - '0';
+    if (c >= 'a' && c <= 'f') return c - 'a' + 10;
+    if (c >= 'A' && c <= 'F') return c - 'A' + 10;
+    return -1;
+}
+
+// Report text as the writer produces it (two hex digits and a blank per byte)
+// is decoded directly; anything else goes to the general hex reader, which
+// accepts more forms. A stream extraction per byte would make reading a full
+// recording several times slower.
+std::vector<std::uint8_t> bytesFromReportText(const std::string& text)
+{
+    std::vector<std::uint8_t> bytes;
+    if (text.size() % 3 == 0) {
+        bytes.reserve(text.size() / 3);
+        for (std::size_t i = 0; i < text.size(); i += 3) {
+            const int high = hexDigit(text[i]);
+            const int low = hexDigit(text[i + 1]);
+            if (high < 0 || low < 0 || text[i + 2] != ' ') return Util::bytesFromHexString(text);
+            bytes.push_back(static_cast<std::uint8_t>(high << 4 | low));
+        }
+        return bytes;
+    }
+    return Util::bytesFromHexString(text);
+}
+
 PropertyValue migrateVersion0(const PropertyDictionary& container)
 {
     PropertyValue::Array frames;
@@ -94,7 +122,7 @@ PipelineRecording::Frame readFrame(const PropertyValue& element)
         const PropertyValue report = object.get(kReportKey);
         if (!report.isString()) reject("invalid report");
         frame.type = Frame::Type::InputReport;
-        frame.report = Util::bytesFromHexString(report.asString());
+        frame.report = bytesFromReportText(report.asString());
     } else {
         reject("invalid frame type");
     }

@@ -135,6 +135,20 @@ TEST(RecordingContainer, VersionZeroMigratesReportsAndBooleansCountAsNumbers)
     EXPECT_TRUE(falseVersion.frames().empty());
 }
 
+TEST(RecordingContainer, ReportTextIsReadInEveryHexForm)
+{
+    PipelineRecording recording{std::string_view(R"({"Version": 1, "Frames": [
+        {"Type": "InputReport", "Timestamp": 1, "Report": "01 A0 Ff "},
+        {"Type": "InputReport", "Timestamp": 2, "Report": "01 a0 ff"},
+        {"Type": "InputReport", "Timestamp": 3, "Report": "0x01   0XA0\nff"},
+        {"Type": "InputReport", "Timestamp": 4, "Report": "01 a0 ff ,02"},
+        {"Type": "InputReport", "Timestamp": 5, "Report": "   "}]})")};
+    std::vector<std::vector<std::uint8_t>> reports;
+    for (const Frame& frame : recording.frames()) reports.push_back(frame.report);
+    const std::vector<std::uint8_t> bytes{0x01, 0xA0, 0xFF};
+    EXPECT_EQ(reports, (std::vector<std::vector<std::uint8_t>>{bytes, bytes, bytes, bytes, {}}));
+}
+
 TEST(RecordingContainer, MigrationReturnsCurrentContainersAsTheSameValue)
 {
     const PropertyValue current = JsonValue::parse(R"({"Version": 1, "Frames": [], "Other": 3})");
