@@ -1,4 +1,5 @@
 // The numbers of the recogniser that are easy to get wrong by one step or one rounding.
+#include "algs/Algs.h"
 #include "algs/HandStats.h"
 #include "algs/Pixel.h"
 #include "algs/SVM.h"
@@ -98,6 +99,19 @@ TEST(VirtualImage, SumsAboveNoiseAndKeepsTheStrongestMember)
     EXPECT_EQ(group.value, 200);
     EXPECT_FALSE(group.active);
     EXPECT_EQ(group.index, 10);
+}
+
+TEST(VirtualImage, GroupSumReachesItsPixelAsASigned16BitReading)
+{
+    Algs algs;
+    Algs::Readings readings{};
+    readings[0] = readings[1] = readings[4] = 20000;  // A, B, E: values 38438 + 37666 + 38326
+    VeltoHost::HidEventList events;
+    algs.processTouchFrame(readings, 1, 1000, events);
+    EXPECT_EQ(algs.virtualImage.values[0], 114430);
+    // 114430 keeps its low 16 bits: -16642, times the "ABE" gain 0.6667.
+    EXPECT_EQ(algs.virtualPixels[0].value, -11095);
+    EXPECT_EQ(algs.virtualPixels[0].index, 0);
 }
 
 std::vector<VirtualPixel> quietGroups()
