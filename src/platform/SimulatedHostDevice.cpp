@@ -1,0 +1,296 @@
+#include "platform/SimulatedHostDevice.h"
+
+#include "platform/MonotonicClock.h"
+
+#include <sys/eventfd.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <utility>
+
+namespace VeltoHost {
+
+SimulatedHostDevice::SimulatedHostDevice() : _eventFd(eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)) {}
+
+SimulatedHostDevice::~SimulatedHostDevice()
+{
+    std::shared_ptr<RunLoop> runLoop;
+    RunLoop::SourceId source = 0;
+    {
+        std::lock_guard<std::mutex> guard(_lock);
+        runLoop = std::move(_runLoop);
+        source = std::exchange(_source, 0);
+    }
+    if (runLoop && source != 0) runLoop->removeSource(source);
+    if (_eventFd >= 0) ::close(_eventFd);
+}
+
+bool SimulatedHostDevice::open(std::uint32_t options)
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    ++_counters.opens;
+    _counters.lastOpenOptions = options;
+    if (_unplugged || _failOpen) return false;
+    _open = true;
+    if (deliverableLocked() && !_pending.empty()) signalLocked();
+    return true;
+}
+
+void SimulatedHostDevice::close(std::uint32_t options)
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    ++_counters.closes;
+    _counters.lastCloseOptions = options;
+    _open = false;
+}
+
+std::int32_t SimulatedHostDevice::getReport(HidReportType type, std::uint32_t reportID, std::uint8_t* buffer,
+                                            std::size_t& length)
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    ++_counters.getReports;
+    if (_unplugged) return kHostDeviceNoDevice;
+    if (!_open) return kHostDeviceNotOpen;
+    if (buffer == nullptr || length == 0) return kHostDeviceBadArgument;
+    if (auto it = _getReportFailureByID.find(reportID); it != _getReportFailureByID.end()) return it->second;
+    if (_getReportFailure) return *_getReportFailure;
+    auto it = _reports.find({type, reportID});
+    if (it == _reports.end()) return kHostDeviceError;
+    const std::vector<std::uint8_t>& bytes = it->second;
+    if (bytes.size() > length) return kHostDeviceBadArgument;
+    std::copy(bytes.begin(), bytes.end(), buffer);
+    length = bytes.size();
+    return kHostDeviceSuccess;
+}
+
+PropertyValue SimulatedHostDevice::getProperty(const std::string& key)
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    if (_unplugged) return {};
+    auto it = _properties.find(key);
+    return it == _properties.end() ? PropertyValue() : it->second;
+}
+
+bool SimulatedHostDevice::setProperty(const std::string& key, const PropertyValue& value)
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    if (_unplugged || _refusePropertyWrites) return false;
+    _properties[key] = value;
+    return true;
+}
+
+void SimulatedHostDevice::registerInputReportWithTimeStampCallback(std::uint8_t* buffer, std::size_t bufferSize,
+                                                                   HostDeviceInputReportCallback callback,
+                                                                   void* context)
+{
+    std::lock_guard<std::recursive_mutex> delivery(_deliveryLock);
+    std::lock_guard<std::mutex> guard(_lock);
+    _buffer = buffer;
+    _bufferSize = buffer ? bufferSize : 0;
+    _callback = callback;
+    _context = context;
+    if (deliverableLocked() && !_pending.empty()) signalLocked();
+}
+
+void SimulatedHostDevice::scheduleWithRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode)
+{
+    if (!runLoop) return;
+    std::shared_ptr<RunLoop> previousLoop;
+    RunLoop::SourceId previousSource = 0;
+    {
+        std::lock_guard<std::mutex> guard(_lock);
+        previousLoop = std::move(_runLoop);
+        previousSource = std::exchange(_source, 0);
+    }
+    // Removed outside the lock: removal waits for a running delivery, which takes the lock.
+    if (previousLoop && previousSource != 0) previousLoop->removeSource(previousSource);
+
+    RunLoop::SourceId source = runLoop->addFileDescriptorSource(_eventFd, mode, [this] { deliverOne(); });
+    std::lock_guard<std::mutex> guard(_lock);
+    ++_counters.schedules;
+    if (source == 0) return;
+    _runLoop = runLoop;
+    _mode = mode;
+    _source = source;
+    if (deliverableLocked() && !_pending.empty()) signalLocked();
+}
+
+void SimulatedHostDevice::unscheduleFromRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode)
+{
+    std::shared_ptr<RunLoop> scheduledLoop;
+    RunLoop::SourceId source = 0;
+    {
+        std::lock_guard<std::mutex> guard(_lock);
+        ++_counters.unschedules;
+        if (_source == 0 || _runLoop != runLoop || _mode != mode) return;
+        scheduledLoop = std::move(_runLoop);
+        source = std::exchange(_source, 0);
+        _mode.clear();
+    }
+    scheduledLoop->removeSource(source);
+}
+
+void SimulatedHostDevice::pushInputReport(std::vector<std::uint8_t> report)
+{
+    std::uint64_t timeStamp = MonotonicClock::now();
+    {
+        std::lock_guard<std::mutex> guard(_lock);
+        if (_unplugged) {
+            ++_counters.reportsDropped;
+        } else {
+            if (_pending.size() >= kMaxPendingReports) {
+                _pending.pop_front();
+                ++_counters.reportsDropped;
+            }
+            _pending.push_back({std::move(report), timeStamp});
+            if (deliverableLocked()) signalLocked();
+        }
+        _progress.notify_all();
+    }
+}
+
+void SimulatedHostDevice::setReport(HidReportType type, std::uint32_t reportID, std::vector<std::uint8_t> bytes)
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    _reports[{type, reportID}] = std::move(bytes);
+}
+
+void SimulatedHostDevice::failGetReport(std::int32_t status)
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    if (status == kHostDeviceSuccess) {
+        _getReportFailure.reset();
+    } else {
+        _getReportFailure = status;
+    }
+}
+
+void SimulatedHostDevice::failGetReport(std::uint32_t reportID, std::int32_t status)
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    if (status == kHostDeviceSuccess) {
+        _getReportFailureByID.erase(reportID);
+    } else {
+        _getReportFailureByID[reportID] = status;
+    }
+}
+
+void SimulatedHostDevice::failOpen(bool fail)
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    _failOpen = fail;
+}
+
+void SimulatedHostDevice::refusePropertyWrites(bool refuse)
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    _refusePropertyWrites = refuse;
+}
+
+void SimulatedHostDevice::unplug()
+{
+    {
+        std::lock_guard<std::mutex> guard(_lock);
+        _unplugged = true;
+        _open = false;
+        _counters.reportsDropped += _pending.size();
+        _pending.clear();
+        _progress.notify_all();
+    }
+}
+
+SimulatedHostDevice::Counters SimulatedHostDevice::counters() const
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    return _counters;
+}
+
+bool SimulatedHostDevice::isOpen() const
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    return _open;
+}
+
+bool SimulatedHostDevice::isScheduled() const
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    return _source != 0;
+}
+
+bool SimulatedHostDevice::hasCallback() const
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    return _callback != nullptr;
+}
+
+std::size_t SimulatedHostDevice::pendingReportCount() const
+{
+    std::lock_guard<std::mutex> guard(_lock);
+    return _pending.size();
+}
+
+bool SimulatedHostDevice::waitUntilIdle(std::chrono::nanoseconds timeout)
+{
+    std::unique_lock<std::mutex> guard(_lock);
+    return _progress.wait_for(guard, timeout, [this] { return _pending.empty() && !_delivering; });
+}
+
+bool SimulatedHostDevice::waitForDelivered(std::uint64_t count, std::chrono::nanoseconds timeout)
+{
+    std::unique_lock<std::mutex> guard(_lock);
+    return _progress.wait_for(guard, timeout, [&] { return _counters.reportsDelivered >= count; });
+}
+
+bool SimulatedHostDevice::deliverableLocked() const
+{
+    return _open && !_unplugged && _source != 0 && _callback != nullptr;
+}
+
+void SimulatedHostDevice::signalLocked()
+{
+    // Extra wake-ups are harmless: a delivery with nothing to deliver does nothing.
+    std::uint64_t one = 1;
+    while (write(_eventFd, &one, sizeof one) < 0 && errno == EINTR) {
+    }
+}
+
+// Runs on the scheduled loop's thread: one report per readable event, so
+// that a loop run that returns after one handled source sees one report.
+void SimulatedHostDevice::deliverOne()
+{
+    std::uint64_t count = 0;
+    while (read(_eventFd, &count, sizeof count) < 0 && errno == EINTR) {
+    }
+
+    std::lock_guard<std::recursive_mutex> delivery(_deliveryLock);
+    PendingReport report;
+    HostDeviceInputReportCallback callback = nullptr;
+    std::uint8_t* buffer = nullptr;
+    std::size_t length = 0;
+    void* context = nullptr;
+    {
+        std::lock_guard<std::mutex> guard(_lock);
+        if (!deliverableLocked() || _pending.empty()) return;
+        report = std::move(_pending.front());
+        _pending.pop_front();
+        _delivering = true;
+        callback = _callback;
+        buffer = _buffer;
+        context = _context;
+        length = std::min(report.bytes.size(), _bufferSize);
+    }
+    if (length > 0) std::memcpy(buffer, report.bytes.data(), length);
+    std::uint32_t reportID = report.bytes.empty() ? 0 : report.bytes[0];
+    callback(context, kHostDeviceSuccess, this, HidReportType::Input, reportID, buffer, length, report.timeStamp);
+    {
+        std::lock_guard<std::mutex> guard(_lock);
+        _delivering = false;
+        ++_counters.reportsDelivered;
+        if (deliverableLocked() && !_pending.empty()) signalLocked();
+        _progress.notify_all();
+    }
+}
+
+}  // namespace VeltoHost
