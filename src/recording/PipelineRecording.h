@@ -21,8 +21,10 @@ namespace VeltoTouch {
 // container, and can be replayed into the wrapped input.
 //
 // Not thread-safe: the owner serialises every call, copies included. Recording
-// never throws; reading a container and playing past the end do.
-class PipelineRecording : public PipelineInput {
+// never throws; reading a container and playing past the end do. Final
+// because it is always owned through its own type (the base has no virtual
+// destructor), which also lets holders keep it in an optional or by value.
+class PipelineRecording final : public PipelineInput {
 public:
     struct Frame {
         enum class Type : std::uint32_t { State = 0, InputReport = 1 };
