@@ -1,0 +1,176 @@
+#include "service/ServiceHarness.h"
+
+#include "platform/HostDeviceRegistry.h"
+#include "platform/MonotonicClock.h"
+#include "platform/PropertyDictionary.h"
+#include "platform/SimulatedHostDevice.h"
+#include "service/VeltoTouchHIDServiceFactory.h"
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+
+namespace VeltoTouch::Test {
+
+using namespace VeltoHost;
+
+namespace {
+
+constexpr auto kPatience = std::chrono::seconds(30);
+
+}  // namespace
+
+void EventCollector::callback(void* target, void* refcon, void* sender, HidEvent* event, std::uint32_t options)
+{
+    auto& collector = *static_cast<EventCollector*>(target);
+    DeliveredEvent delivered;
+    delivered.type = event->type();
+    delivered.phase = event->phase();
+    delivered.timeStamp = event->timeStamp();
+    delivered.usagePage = event->vendorDefined().usagePage;
+    delivered.usage = event->vendorDefined().usage;
+    delivered.y = event->digitizer().y;
+    delivered.target = target;
+    delivered.refcon = refcon;
+    delivered.sender = sender;
+    delivered.options = options;
+    delivered.thread = std::this_thread::get_id();
+    std::lock_guard<std::mutex> lock(collector._lock);
+    delivered.onQueue = collector._queue && collector._queue->isCurrent();
+    collector._events.push_back(delivered);
+    collector._arrived.notify_all();
+}
+
+void EventCollector::setQueue(SerialQueue::Ref queue)
+{
+    std::lock_guard<std::mutex> lock(_lock);
+    _queue = std::move(queue);
+}
+
+bool EventCollector::waitFor(std::size_t count)
+{
+    std::unique_lock<std::mutex> lock(_lock);
+    return _arrived.wait_for(lock, kPatience, [&] { return _events.size() >= count; });
+}
+
+std::vector<DeliveredEvent> EventCollector::events() const
+{
+    std::lock_guard<std::mutex> lock(_lock);
+    return _events;
+}
+
+std::size_t EventCollector::count() const
+{
+    std::lock_guard<std::mutex> lock(_lock);
+    return _events.size();
+}
+
+ServiceHarness::ServiceHarness(bool withDevice) : _queue(SerialQueue::create("service.test.events"))
+{
+    collector.setQueue(_queue);
+    if (withDevice) {
+        _device = SimulatedHostDevice::create();
+        HostDeviceRegistry::shared().set(kServiceHandle, _device);
+    }
+    _plugin = VeltoTouchHIDServiceFactory(nullptr, kVeltoHIDServicePluginTypeID);
+    VeltoStatus status = plugin().QueryInterface(_plugin, kVeltoHIDServiceInterface2ID, &_service);
+    EXPECT_EQ(status, kVeltoSuccess);
+}
+
+ServiceHarness::~ServiceHarness()
+{
+    service().Release(_service);
+    plugin().Release(_plugin);
+    if (_device) HostDeviceRegistry::shared().remove(kServiceHandle);
+    _queue->drain();
+}
+
+PluginInterfaceTable& ServiceHarness::plugin() const { return **static_cast<PluginInterfaceTable**>(_plugin); }
+
+ServiceInterfaceTable& ServiceHarness::service() const { return **static_cast<ServiceInterfaceTable**>(_service); }
+
+void ServiceHarness::bringUp()
+{
+    ASSERT_EQ(plugin().Start(_plugin, PropertyValue::dictionary({}), kServiceHandle), kVeltoSuccess);
+    ASSERT_TRUE(service().open(_service, 0));
+    setCallback(collector);
+    schedule();
+}
+
+void ServiceHarness::tearDown()
+{
+    unschedule();
+    service().close(_service, 0);
+    EXPECT_EQ(plugin().Stop(_plugin), kVeltoSuccess);
+}
+
+void ServiceHarness::schedule() { service().scheduleWithDispatchQueue(_service, _queue.get()); }
+
+void ServiceHarness::unschedule() { service().unscheduleFromDispatchQueue(_service, _queue.get()); }
+
+void ServiceHarness::setCallback(EventCollector& target, void* refcon)
+{
+    service().setEventCallback(_service, EventCollector::callback, &target, refcon);
+}
+
+PropertyValue ServiceHarness::copyProperty(const char* key) const { return service().copyProperty(_service, key); }
+
+bool ServiceHarness::setProperty(const char* key, const PropertyValue& value) const
+{
+    return service().setProperty(_service, key, value);
+}
+
+void ServiceHarness::push(const std::vector<std::uint8_t>& report) { _device->pushInputReport(report); }
+
+bool ServiceHarness::waitForResetCount(std::uint32_t count) const
+{
+    auto deadline = std::chrono::steady_clock::now() + kPatience;
+    while (std::chrono::steady_clock::now() < deadline) {
+        PropertyValue info = copyProperty("Pipeline.DebugInfo");
+        if (info.asDictionary().get("ResetCount").toUInt64() >= count) return true;
+        MonotonicClock::sleepMicroseconds(1000);
+    }
+    return false;
+}
+
+void ServiceHarness::setDebugReport(std::uint8_t reportID, std::vector<std::uint8_t> bytes)
+{
+    _device->setFeatureReport(reportID, std::move(bytes));
+}
+
+void ServiceHarness::setAllReportsFail(std::int32_t status) { _device->failGetReport(status); }
+
+void ServiceHarness::setDeviceProperty(const std::string& key, PropertyValue value)
+{
+    _device->setProperty(key, value);
+}
+
+PropertyValue ServiceHarness::deviceProperty(const std::string& key) const { return _device->getProperty(key); }
+
+void ServiceHarness::setDeviceAcceptsWrites(bool accepts) { _device->refusePropertyWrites(!accepts); }
+
+bool ServiceHarness::deviceIsScheduled() const { return _device->isScheduled(); }
+
+bool ServiceHarness::deviceHasCallback() const { return _device->hasCallback(); }
+
+std::vector<std::uint8_t> firmwareEventReport(std::uint8_t code, std::uint64_t context)
+{
+    std::vector<std::uint8_t> bytes{0x02, code};
+    for (int shift = 56; shift >= 0; shift -= 8) bytes.push_back(static_cast<std::uint8_t>(context >> shift));
+    return bytes;
+}
+
+std::vector<std::uint8_t> deviceResetReport(std::uint64_t context) { return firmwareEventReport(0, context); }
+
+std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs)
+{
+    std::vector<std::uint8_t> bytes(73, 0);
+    bytes[0] = 0x01;
+    for (int i = 0; i < 4; ++i) {
+        bytes[1 + i] = static_cast<std::uint8_t>(frameNumber >> (8 * i));
+        bytes[5 + i] = static_cast<std::uint8_t>(timeMs >> (8 * i));
+    }
+    return bytes;
+}
+
+}  // namespace VeltoTouch::Test

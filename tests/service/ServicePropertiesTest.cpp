@@ -1,0 +1,222 @@
+// Service properties: the "Pipeline" domain, the diagnostic keys and the
+// device's own keys, read and written while reports flow; and the device
+// failures that properties and start must survive.
+
+#include "platform/PropertyDictionary.h"
+#include "recording/PipelineRecording.h"
+#include "service/ServiceHarness.h"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <cstdio>
+#include <string>
+#include <thread>
+
+using namespace VeltoHost;
+using namespace VeltoTouch::Test;
+
+namespace {
+
+constexpr std::uint8_t kDebugReportIDs[] = {0x04, 0x10, 0x11, 0x12, 0x13, 0x1D, 0x32, 0x3B, 0x3C, 0x3F};
+constexpr const char* kDebugReportKeys[] = {"0x04", "0x10", "0x11", "0x12", "0x13",
+                                            "0x1d", "0x32", "0x3b", "0x3c", "0x3f"};
+
+std::size_t countFrames(const VeltoTouch::PipelineRecording& recording,
+                        VeltoTouch::PipelineRecording::Frame::Type type)
+{
+    std::size_t count = 0;
+    for (const auto& frame : recording.frames()) count += frame.type == type;
+    return count;
+}
+
+}  // namespace
+
+TEST(ServiceProperties, ReadsAndWritesWhileReportsFlow)
+{
+    ServiceHarness harness;
+    harness.setDebugReport(0x04, {0x04, 0xAB, 0x00});
+    harness.setDebugReport(0x1F, {0x1F, 0x10, 0x27, 0x00, 0x00});  // 10000
+    harness.setDeviceProperty("Product", PropertyValue::string("Velto Touch"));
+    harness.bringUp();
+
+    constexpr int kImages = 1600;
+    constexpr int kResetEvery = 200;
+    std::atomic<bool> done{false};
+    std::thread pusher([&] {
+        for (int i = 1; i <= kImages; ++i) {
+            harness.push(imageReport(static_cast<std::uint32_t>(i), static_cast<std::uint32_t>(10 * i)));
+            if (i % kResetEvery == 0) harness.push(deviceResetReport());
+        }
+        done = true;
+    });
+
+    std::uint32_t written = 0;
+    int rounds = 0;
+    while (!done || rounds < 3) {
+        ++rounds;
+        written = 300 + static_cast<std::uint32_t>(rounds);
+        EXPECT_TRUE(harness.setProperty("Pipeline.Algs.HoldTimeoutMilliseconds", PropertyValue::uint32(written)));
+        EXPECT_EQ(harness.copyProperty("Pipeline.Algs.HoldTimeoutMilliseconds"), PropertyValue::uint32(written));
+
+        PropertyValue info = harness.copyProperty("Pipeline.DebugInfo");
+        ASSERT_TRUE(info.isDictionary());
+        EXPECT_TRUE(info.asDictionary().get("ResetCount").isNumber());
+
+        PropertyValue version = harness.copyProperty("Version");
+        EXPECT_EQ(version, PropertyValue::array({PropertyValue::int32(28), PropertyValue::int32(0),
+                                                 PropertyValue::int32(0)}));
+        PropertyValue text = harness.copyProperty("Recording");
+        ASSERT_TRUE(text.isString());
+        VeltoTouch::PipelineRecording recording(std::string_view(text.asString()));
+        EXPECT_LE(countFrames(recording, VeltoTouch::PipelineRecording::Frame::Type::InputReport), 1350u);
+
+        PropertyValue debug = harness.copyProperty("ServicePluginDebug");
+        ASSERT_TRUE(debug.isDictionary());
+        EXPECT_TRUE(debug.asDictionary().contains("Recording"));
+        EXPECT_TRUE(debug.asDictionary().contains("Pipeline.DebugInfo"));
+        EXPECT_EQ(harness.copyProperty("FirmwareDebugReports").asDictionary().size(), 10u);
+        EXPECT_EQ(harness.copyProperty("FactoryResetHoldDuration"), PropertyValue::uint32(10000));
+        EXPECT_EQ(harness.copyProperty("Product"), PropertyValue::string("Velto Touch"));
+    }
+    pusher.join();
+    ASSERT_TRUE(harness.collector.waitFor(kImages / kResetEvery));
+    harness.queue()->drain();
+
+    // Every report went through; the counters agree with what was pushed.
+    PropertyValue info = harness.copyProperty("Pipeline.DebugInfo");
+    EXPECT_EQ(info.asDictionary().get("ResetCount"), PropertyValue::uint32(kImages / kResetEvery));
+    EXPECT_EQ(info.asDictionary().get("DisjointImageCount"), PropertyValue::uint32(0));
+
+    // The last write is in the recording, keyed relative to the pipeline.
+    PropertyValue text = harness.copyProperty("Recording");
+    VeltoTouch::PipelineRecording recording(std::string_view(text.asString()));
+    const VeltoTouch::PipelineRecording::Frame* lastState = nullptr;
+    for (const auto& frame : recording.frames()) {
+        if (frame.type == VeltoTouch::PipelineRecording::Frame::Type::State) lastState = &frame;
+        EXPECT_EQ(frame.key.rfind("Pipeline", 0), std::string::npos) << frame.key;
+    }
+    ASSERT_NE(lastState, nullptr);
+    EXPECT_EQ(lastState->key, "Algs.HoldTimeoutMilliseconds");
+    EXPECT_EQ(lastState->value.toUInt64(), written);
+    EXPECT_EQ(countFrames(recording, VeltoTouch::PipelineRecording::Frame::Type::InputReport), 1350u);
+
+    // Reading the recording does not change it; the aggregate holds exactly
+    // what the separate reads give when nothing moves.
+    EXPECT_EQ(harness.copyProperty("Recording"), text);
+    PropertyValue debug = harness.copyProperty("ServicePluginDebug");
+    const PropertyDictionary& entries = debug.asDictionary();
+    for (const char* key : {"Version", "FirmwareDebugReports", "Recording", "Pipeline.DebugInfo",
+                            "Pipeline.Algs.DebugInfo"}) {
+        EXPECT_EQ(entries.get(key), harness.copyProperty(key)) << key;
+    }
+    EXPECT_EQ(entries.size(), 5u);
+    harness.tearDown();
+}
+
+TEST(ServiceProperties, KeysAreRoutedByDomainAndName)
+{
+    ServiceHarness harness;
+    harness.setDeviceProperty("Pipeline", PropertyValue::string("device's own"));
+    harness.setDeviceProperty("Recording", PropertyValue::string("stale"));
+    harness.bringUp();
+
+    // The domain needs its dot; a bare "Pipeline" belongs to the device.
+    EXPECT_EQ(harness.copyProperty("Pipeline"), PropertyValue::string("device's own"));
+    // A pipeline key it does not know is null and never reaches the device.
+    harness.setDeviceProperty("Pipeline.Unknown", PropertyValue::string("device"));
+    EXPECT_FALSE(harness.copyProperty("Pipeline.Unknown").hasValue());
+    EXPECT_TRUE(harness.setProperty("Pipeline.Unknown", PropertyValue::int32(1)));
+    EXPECT_FALSE(harness.copyProperty("pipeline.DebugInfo").hasValue());
+    EXPECT_FALSE(harness.copyProperty(nullptr).hasValue());
+    EXPECT_FALSE(harness.setProperty(nullptr, PropertyValue::int32(1)));
+
+    // Diagnostic keys cannot be written: a write goes to the device and the
+    // recording keeps its frames.
+    harness.push(deviceResetReport());
+    ASSERT_TRUE(harness.collector.waitFor(1));
+    PropertyValue before = harness.copyProperty("Recording");
+    harness.setDeviceAcceptsWrites(true);
+    EXPECT_TRUE(harness.setProperty("Recording", PropertyValue::string("x")));
+    EXPECT_EQ(harness.deviceProperty("Recording"), PropertyValue::string("x"));
+    PropertyValue after = harness.copyProperty("Recording");
+    VeltoTouch::PipelineRecording kept(std::string_view(after.asString()));
+    EXPECT_EQ(kept.frames().size(), 2u);  // the "Pipeline.Unknown" state and the reset report
+    EXPECT_EQ(after, before);
+    harness.setDeviceAcceptsWrites(false);
+    EXPECT_FALSE(harness.setProperty("Version", PropertyValue::int32(1)));
+
+    // The firmware reports: hex text for what the device has, the failure
+    // text with the unpadded ID for the rest; ten entries in any case.
+    harness.setDebugReport(0x3C, {0x3C, 0x00, 0xFF});
+    PropertyValue reports = harness.copyProperty("FirmwareDebugReports");
+    ASSERT_TRUE(reports.isDictionary());
+    ASSERT_EQ(reports.asDictionary().size(), 10u);
+    std::size_t index = 0;
+    for (const auto& [key, value] : reports.asDictionary()) {
+        EXPECT_EQ(key, kDebugReportKeys[index]);
+        if (kDebugReportIDs[index] == 0x3C) {
+            EXPECT_EQ(value, PropertyValue::string("3c 00 ff "));
+        } else {
+            char prefix[40];
+            std::snprintf(prefix, sizeof prefix, "Failed to get report ID 0x%x: 0x", kDebugReportIDs[index]);
+            EXPECT_EQ(value.asString().rfind(prefix, 0), 0u) << value.asString();
+        }
+        ++index;
+    }
+    EXPECT_FALSE(harness.copyProperty("FactoryResetHoldDuration").hasValue());
+    harness.tearDown();
+}
+
+TEST(ServiceProperties, DeviceFailuresAreSoft)
+{
+    // No device for the handle: start reports no resources, and the service
+    // still answers everything that does not need the device.
+    {
+        ServiceHarness harness(false);
+        EXPECT_EQ(harness.plugin().Start(harness.pluginRef(), PropertyValue::dictionary({}),
+                                         ServiceHarness::kServiceHandle),
+                  kVeltoNoResources);
+        EXPECT_FALSE(harness.service().open(harness.serviceRef(), 0));
+        harness.service().close(harness.serviceRef(), 0);
+
+        PropertyValue reports = harness.copyProperty("FirmwareDebugReports");
+        ASSERT_EQ(reports.asDictionary().size(), 10u);
+        EXPECT_EQ(reports.asDictionary().get("0x04").asString().rfind("Failed to get report ID 0x4: 0x", 0), 0u);
+        EXPECT_FALSE(harness.copyProperty("FactoryResetHoldDuration").hasValue());
+        EXPECT_FALSE(harness.copyProperty("Product").hasValue());
+        EXPECT_FALSE(harness.setProperty("Product", PropertyValue::int32(1)));
+        EXPECT_TRUE(harness.copyProperty("Version").isArray());
+        EXPECT_TRUE(harness.copyProperty("Pipeline.DebugInfo").isDictionary());
+        EXPECT_TRUE(harness.setProperty("Pipeline.Algs.HoldTimeoutMilliseconds", PropertyValue::uint32(5)));
+
+        // Scheduling without a device starts and ends the thread all the same.
+        EventCollector collector;
+        harness.setCallback(collector);
+        harness.schedule();
+        harness.unschedule();
+        EXPECT_EQ(harness.plugin().Stop(harness.pluginRef()), kVeltoSuccess);
+    }
+
+    // A device whose feature reports all fail: ten failure entries carrying
+    // the device's status, and no hold duration.
+    {
+        ServiceHarness harness;
+        harness.setAllReportsFail(static_cast<std::int32_t>(0xE00002D8u));
+        harness.bringUp();
+        PropertyValue reports = harness.copyProperty("FirmwareDebugReports");
+        ASSERT_EQ(reports.asDictionary().size(), 10u);
+        std::size_t index = 0;
+        for (const auto& [key, value] : reports.asDictionary()) {
+            char expected[64];
+            std::snprintf(expected, sizeof expected, "Failed to get report ID 0x%x: 0xe00002d8", kDebugReportIDs[index]);
+            EXPECT_EQ(key, kDebugReportKeys[index]);
+            EXPECT_EQ(value, PropertyValue::string(expected));
+            ++index;
+        }
+        EXPECT_FALSE(harness.copyProperty("FactoryResetHoldDuration").hasValue());
+        PropertyValue debug = harness.copyProperty("ServicePluginDebug");
+        EXPECT_EQ(debug.asDictionary().get("FirmwareDebugReports"), reports);
+        harness.tearDown();
+    }
+}

@@ -1,0 +1,115 @@
+// Scheduling and unscheduling: the thread's start and exit handshake, many
+// times over, the callback taken at scheduling, and deliveries that are still
+// queued when the thread goes.
+
+#include "platform/PropertyDictionary.h"
+#include "platform/Semaphore.h"
+#include "platform/Trace.h"
+#include "service/ServiceHarness.h"
+
+#include <gtest/gtest.h>
+
+#include <condition_variable>
+#include <mutex>
+
+using namespace VeltoHost;
+using namespace VeltoTouch::Test;
+
+TEST(ServiceScheduling, RepeatedCyclesDeliverWithTheCallbackOfTheirScheduling)
+{
+    ServiceHarness harness;
+    ASSERT_EQ(harness.plugin().Start(harness.pluginRef(), PropertyValue::dictionary({}), ServiceHarness::kServiceHandle),
+              kVeltoSuccess);
+    ASSERT_TRUE(harness.service().open(harness.serviceRef(), 0));
+
+    // Unscheduling what never ran returns at once.
+    harness.unschedule();
+
+    constexpr int kCycles = 60;
+    int refcons[kCycles];
+    for (int cycle = 0; cycle < kCycles; ++cycle) {
+        harness.setCallback(harness.collector, &refcons[cycle]);
+        harness.schedule();
+        // A callback set while the thread runs waits for the next scheduling.
+        if (cycle + 1 < kCycles) harness.setCallback(harness.collector, &refcons[cycle + 1]);
+        harness.push(deviceResetReport(static_cast<std::uint64_t>(cycle)));
+        ASSERT_TRUE(harness.collector.waitFor(static_cast<std::size_t>(cycle) + 1)) << cycle;
+        harness.unschedule();
+        EXPECT_FALSE(harness.deviceIsScheduled()) << cycle;
+        EXPECT_FALSE(harness.deviceHasCallback()) << cycle;
+    }
+    harness.queue()->drain();
+    std::vector<DeliveredEvent> events = harness.collector.events();
+    ASSERT_EQ(events.size(), static_cast<std::size_t>(kCycles));
+    for (int cycle = 0; cycle < kCycles; ++cycle) {
+        EXPECT_EQ(events[static_cast<std::size_t>(cycle)].refcon, &refcons[cycle]) << cycle;
+        EXPECT_EQ(events[static_cast<std::size_t>(cycle)].sender, harness.serviceRef());
+    }
+
+    // After the last cycle nothing listens: a report is not processed.
+    harness.push(deviceResetReport());
+    PropertyValue info = harness.copyProperty("Pipeline.DebugInfo");
+    EXPECT_EQ(info.asDictionary().get("ResetCount"), PropertyValue::uint32(kCycles));
+    harness.service().close(harness.serviceRef(), 0);
+    EXPECT_EQ(harness.plugin().Stop(harness.pluginRef()), kVeltoSuccess);
+}
+
+TEST(ServiceScheduling, DeliveriesQueuedBeforeUnschedulingStillArrive)
+{
+    // Seeing the firmware-event trace point means the report is being
+    // processed: the thread stops only after it has been handled completely.
+    std::mutex lock;
+    std::condition_variable seen;
+    int firmwareEvents = 0;
+    Trace::Observer previous = Trace::setObserver([&](const TracePoint& point) {
+        if (point.code != 0x2B15018C) return;
+        std::lock_guard<std::mutex> guard(lock);
+        ++firmwareEvents;
+        seen.notify_all();
+    });
+
+    ServiceHarness harness;
+    harness.bringUp();
+
+    // Hold the host's queue so that the batch stays queued.
+    Semaphore::Ref gate = Semaphore::create(0);
+    harness.queue()->async([gate] { gate->wait(); });
+    harness.push(deviceResetReport());
+    harness.push(deviceResetReport());
+    {
+        std::unique_lock<std::mutex> guard(lock);
+        ASSERT_TRUE(seen.wait_for(guard, std::chrono::seconds(20), [&] { return firmwareEvents == 2; }));
+    }
+    harness.unschedule();
+    EXPECT_EQ(harness.collector.count(), 0u);
+    gate->signal();
+    ASSERT_TRUE(harness.collector.waitFor(2));
+    harness.queue()->drain();
+    EXPECT_EQ(harness.collector.count(), 2u);
+    harness.service().close(harness.serviceRef(), 0);
+    harness.plugin().Stop(harness.pluginRef());
+    Trace::setObserver(previous);
+}
+
+TEST(ServiceScheduling, EventsWithoutACallbackAreDropped)
+{
+    ServiceHarness harness;
+    ASSERT_EQ(harness.plugin().Start(harness.pluginRef(), PropertyValue::dictionary({}), ServiceHarness::kServiceHandle),
+              kVeltoSuccess);
+    ASSERT_TRUE(harness.service().open(harness.serviceRef(), 0));
+    harness.schedule();  // no callback was ever set
+    harness.push(deviceResetReport());
+    ASSERT_TRUE(harness.waitForResetCount(1));
+    harness.unschedule();
+    harness.queue()->drain();
+
+    // The next scheduling with a callback delivers again.
+    harness.setCallback(harness.collector);
+    harness.schedule();
+    harness.push(deviceResetReport());
+    ASSERT_TRUE(harness.collector.waitFor(1));
+    harness.unschedule();
+    harness.queue()->drain();
+    EXPECT_EQ(harness.collector.count(), 1u);
+    harness.plugin().Stop(harness.pluginRef());
+}
