@@ -162,13 +162,21 @@ std::vector<std::uint8_t> firmwareEventReport(std::uint8_t code, std::uint64_t c
 
 std::vector<std::uint8_t> deviceResetReport(std::uint64_t context) { return firmwareEventReport(0, context); }
 
-std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs)
+std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs,
+                                      std::initializer_list<std::pair<int, std::int16_t>> readings)
 {
+    // ID, frame number and time little-endian, then (at 43) one signed
+    // 16-bit reading per pad.
     std::vector<std::uint8_t> bytes(73, 0);
     bytes[0] = 0x01;
     for (int i = 0; i < 4; ++i) {
         bytes[1 + i] = static_cast<std::uint8_t>(frameNumber >> (8 * i));
         bytes[5 + i] = static_cast<std::uint8_t>(timeMs >> (8 * i));
+    }
+    for (const auto& [pad, reading] : readings) {
+        auto value = static_cast<std::uint16_t>(reading);
+        bytes[static_cast<std::size_t>(43 + 2 * pad)] = static_cast<std::uint8_t>(value);
+        bytes[static_cast<std::size_t>(44 + 2 * pad)] = static_cast<std::uint8_t>(value >> 8);
     }
     return bytes;
 }

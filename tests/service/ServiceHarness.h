@@ -6,11 +6,13 @@
 #include "platform/SerialQueue.h"
 
 #include <condition_variable>
+#include <initializer_list>
 #include <cstdint>
 #include <memory>
 #include <mutex>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 namespace VeltoHost {
@@ -111,6 +113,8 @@ private:
 // Report bytes.
 std::vector<std::uint8_t> deviceResetReport(std::uint64_t context = 0);
 std::vector<std::uint8_t> firmwareEventReport(std::uint8_t code, std::uint64_t context);
-std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs);
+// An image with every pad at 0 except those given (pad index, reading).
+std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs,
+                                      std::initializer_list<std::pair<int, std::int16_t>> readings = {});
 
 }  // namespace VeltoTouch::Test
