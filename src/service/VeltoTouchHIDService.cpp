@@ -10,6 +10,7 @@
 #include "platform/Trace.h"
 
 #include <algorithm>
+#include <memory>
 #include <optional>
 #include <utility>
 #include <vector>
@@ -40,17 +41,18 @@ void deliverEvents(const VeltoTouchHIDService::DispatchEventInfo& info, const Hi
 
 // The output probe: runs on the input-report thread under the pipeline lock,
 // so it only copies references and hands one job to the host's queue.
-void dispatchEvents(const VeltoTouchHIDService::DispatchEventInfo& info, const HidEventList& events, const Log& log)
+void dispatchEvents(const VeltoTouchHIDService::DispatchEventInfo& info, const HidEventList& events,
+                    const std::shared_ptr<const Log>& log)
 {
     HidEventList batch(events);
-    log.debug("HID events probe: %ju event(s)", batch.size());
+    log->debug("HID events probe: %ju event(s)", batch.size());
     if (batch.empty()) return;
-    log.debug("Dispatch %ju event(s) takeoff", batch.size());
+    log->debug("Dispatch %ju event(s) takeoff", batch.size());
     if (!info.queue) return;
     // The job owns its events and its own reference to the queue, so batches
     // still queued deliver after the thread has ended and the service has
     // dropped the queue.
-    info.queue->async([info, batch = std::move(batch), log] { deliverEvents(info, batch, log); });
+    info.queue->async([info, batch = std::move(batch), log] { deliverEvents(info, batch, *log); });
 }
 
 std::uint64_t reportByte(const std::uint8_t* report, std::size_t length, std::size_t index)
@@ -219,32 +221,36 @@ void VeltoTouchHIDService::handleInputReport(const std::uint8_t* report, std::si
 
 void VeltoTouchHIDService::installPipelineProbes(const DispatchEventInfo& info)
 {
-    const Log log = _log;
+    // Delivery jobs may run after the service is gone, so they share their
+    // own log handle; the other probes run only while the thread (and so the
+    // service) lives.
+    auto jobLog = std::make_shared<const Log>(_log);
+    const Log* log = &_log;
     std::lock_guard<std::mutex> lock(_pipelineLock);
     Pipeline& pipeline = *_pipeline;
     pipeline.inputReportProbe = [log](const std::uint8_t* report, std::size_t length) {
         Trace::emit(kTraceInputReport, reportByte(report, length, 0), reportByte(report, length, 1),
                     reportByte(report, length, 2), reportByte(report, length, 3));
-        log.debug("Input report probe");
+        log->debug("Input report probe");
     };
     pipeline.invalidInputReportProbe = [log](const std::uint8_t* report, std::size_t length) {
         if (length != 0) {
-            log.debug("Invalid input report with ID %ju", report[0]);
+            log->debug("Invalid input report with ID %ju", report[0]);
         } else {
-            log.debug("Invalid input report len==0");
+            log->debug("Invalid input report len==0");
         }
     };
     pipeline.firmwareEventProbe = [log](const InputReport::FirmwareEvent& event) {
         Trace::emit(kTraceFirmwareEvent, event.event, event.contextValue(), 0, 0);
-        log.log("Firmware event probe; event: %jx, context: %jx", event.event, event.contextValue());
+        log->log("Firmware event probe; event: %jx, context: %jx", event.event, event.contextValue());
     };
     pipeline.imageProbe = [log](const InputReport::Image& image) {
-        log.log("Received image frame: %ju", image.frameNumber);
+        log->log("Received image frame: %ju", image.frameNumber);
     };
     pipeline.disjointImageProbe = [log](std::uint32_t previousFrameNumber, const InputReport::Image& image) {
-        log.error("Disjoint image (frame number: %ju -> %ju)\n\n", previousFrameNumber, image.frameNumber);
+        log->error("Disjoint image (frame number: %ju -> %ju)\n\n", previousFrameNumber, image.frameNumber);
     };
-    pipeline.hidEventsProbe = [info, log](const HidEventList& events) { dispatchEvents(info, events, log); };
+    pipeline.hidEventsProbe = [info, jobLog](const HidEventList& events) { dispatchEvents(info, events, jobLog); };
 }
 
 void VeltoTouchHIDService::clearPipelineProbes()
