@@ -2,6 +2,8 @@
 // device's own keys, read and written while reports flow; and the device
 // failures that properties and start must survive.
 
+#include "platform/CaptureLogSink.h"
+#include "platform/HidEvent.h"
 #include "platform/PropertyDictionary.h"
 #include "recording/PipelineRecording.h"
 #include "service/ServiceHarness.h"
@@ -219,4 +221,34 @@ TEST(ServiceProperties, DeviceFailuresAreSoft)
         EXPECT_EQ(debug.asDictionary().get("FirmwareDebugReports"), reports);
         harness.tearDown();
     }
+}
+
+TEST(ServiceProperties, PropertyCallsLogTheirKeysAndTheAggregateLooksUpEachKeyOnItsOwn)
+{
+    ServiceHarness harness;
+    harness.bringUp();
+    std::vector<std::string> lines;
+    {
+        CaptureLogSink::Scope capture(LogLevel::Debug);
+        harness.setProperty("Pipeline.Algs.HoldTimeoutMilliseconds", PropertyValue::uint32(420));
+        harness.copyProperty("ServicePluginDebug");
+        // The service refuses what it does not do, through the tables too.
+        HidEventRef event = HidEvent::createVendorDefinedEvent(0, 1, 1, 0, nullptr, 0, 0);
+        EXPECT_EQ(harness.service().setOutputEvent(harness.serviceRef(), event.get()), kVeltoUnsupported);
+        EXPECT_EQ(harness.service().copyEvent(harness.serviceRef(), HidEvent::kTypeDigitizer, event.get(), 0),
+                  nullptr);
+        lines = capture.sink().messages("HIDService");
+    }
+    EXPECT_EQ(lines, (std::vector<std::string>{
+                         "setProperty:420 forKey:Pipeline.Algs.HoldTimeoutMilliseconds",
+                         "getPropertyForKey:ServicePluginDebug",
+                         "getPropertyForKey:Version",
+                         "getPropertyForKey:FirmwareDebugReports",
+                         "getPropertyForKey:Recording",
+                         "getPropertyForKey:Pipeline.DebugInfo",
+                         "getPropertyForKey:Pipeline.Algs.DebugInfo",
+                         "setOutputEvent:",
+                         "copyEventWithType:matching:options:",
+                     }));
+    harness.tearDown();
 }
