@@ -20,6 +20,7 @@
 #include "platform/Semaphore.h"
 #include "platform/SerialQueue.h"
 #include "platform/SimulatedHostDevice.h"
+#include "platform/Thread.h"
 #include "platform/Trace.h"
 #include "service/VeltoTouchHIDService.h"
 
@@ -38,6 +39,7 @@ using VeltoTouch::VeltoTouchHIDService;
 
 constexpr std::uint32_t kServiceHandle = 0xBE7C;
 constexpr std::uint32_t kTraceInputReport = 0x2B150180;
+constexpr std::uint32_t kTraceDispatchBatch = 0x2B150184;
 constexpr int kSamples = 5000;
 constexpr std::uint64_t kSpacingMicroseconds = 200;
 
@@ -70,16 +72,25 @@ std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber)
 }
 
 // The floor: one thread wakes another through a semaphore, the same kind of
-// hand-off that each of the service's two thread crossings costs.
+// hand-off that each of the service's two thread crossings costs. With the
+// argument 1 the receiver asks for the input-report thread's real-time
+// priority first, as the service's thread does: where that is granted, the
+// kernel's wake-up of a real-time thread is itself part of the floor.
 void BM_HandOffFloor(benchmark::State& state)
 {
+    const bool realTime = state.range(0) != 0;
     for (auto _ : state) {
         Semaphore go;
         Semaphore done;
         std::atomic<std::uint64_t> sent{0};
         std::vector<std::uint64_t> samples;
         samples.reserve(kSamples);
+        int schedulingError = -1;
         std::thread receiver([&] {
+            if (realTime) {
+                schedulingError = Thread::setCurrentScheduling(VeltoTouchHIDService::kInputReportThreadPolicy,
+                                                               VeltoTouchHIDService::kInputReportThreadPriority);
+            }
             for (int i = 0; i < kSamples; ++i) {
                 go.wait();
                 samples.push_back(MonotonicClock::now() - sent.load(std::memory_order_acquire));
@@ -94,6 +105,7 @@ void BM_HandOffFloor(benchmark::State& state)
         }
         receiver.join();
         reportPercentiles(state, samples, "");
+        state.counters["real_time"] = schedulingError == 0 ? 1 : 0;
     }
 }
 
@@ -165,21 +177,53 @@ private:
     Trace::Observer _previous;
 };
 
+// Notes when the pipeline takes a report and when its batch lands on the
+// host's queue, without waking anybody, to split the latency into the two
+// thread crossings.
+class StageWatch {
+public:
+    StageWatch()
+    {
+        _previous = Trace::setObserver([this](const TracePoint& point) {
+            if (point.code == kTraceInputReport) entered.store(MonotonicClock::now(), std::memory_order_release);
+            if (point.code == kTraceDispatchBatch) landed.store(MonotonicClock::now(), std::memory_order_release);
+        });
+    }
+    ~StageWatch() { Trace::setObserver(_previous); }
+
+    std::atomic<std::uint64_t> entered{0};
+    std::atomic<std::uint64_t> landed{0};
+
+private:
+    Trace::Observer _previous;
+};
+
 void BM_ServiceReportToCallback(benchmark::State& state)
 {
     Log::setThreshold(Log::kOff);
     for (auto _ : state) {
-        // No trace observer here: its wake-up of this thread would compete
-        // with the delivery for the two cores.
         RunningService running;
+        StageWatch stages;
         std::vector<std::uint64_t> samples;
+        std::vector<std::uint64_t> toPipeline;
+        std::vector<std::uint64_t> toQueue;
+        std::vector<std::uint64_t> toCallback;
         samples.reserve(kSamples);
         for (int i = 0; i < kSamples; ++i) {
             MonotonicClock::sleepMicroseconds(kSpacingMicroseconds);
             std::uint64_t pushed = running.send(deviceResetReport(), false, true);
-            samples.push_back(running.deliveredAt.load(std::memory_order_acquire) - pushed);
+            std::uint64_t entered = stages.entered.load(std::memory_order_acquire);
+            std::uint64_t landed = stages.landed.load(std::memory_order_acquire);
+            std::uint64_t delivered = running.deliveredAt.load(std::memory_order_acquire);
+            samples.push_back(delivered - pushed);
+            toPipeline.push_back(entered - pushed);
+            toQueue.push_back(landed - entered);
+            toCallback.push_back(delivered - landed);
         }
         reportPercentiles(state, samples, "");
+        reportPercentiles(state, toPipeline, "device_to_pipeline_");
+        reportPercentiles(state, toQueue, "pipeline_to_queue_");
+        reportPercentiles(state, toCallback, "queue_to_callback_");
     }
 }
 
@@ -227,7 +271,7 @@ void BM_ServiceStallDuringRecordingReads(benchmark::State& state)
 
 }  // namespace
 
-BENCHMARK(BM_HandOffFloor)->Iterations(1)->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_HandOffFloor)->Arg(0)->Arg(1)->Iterations(1)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_ServiceReportToCallback)->Iterations(1)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_ServiceStallDuringRecordingReads)->Arg(0)->Arg(1)->Iterations(1)->Unit(benchmark::kMillisecond);
 
