@@ -264,3 +264,44 @@ TEST(ServiceCycle, EventsArriveOnTheQueueInReportOrderOneJobPerReport)
     for (const TracePoint& batch : batches) EXPECT_EQ(batch.arg1, 1u);
     harness.tearDown();
 }
+
+TEST(ServiceCycle, ATapAndAResetArriveAsTheirEventsInOrderStampedWithTheirReportsTimes)
+{
+    constexpr int kPadK = 'K' - 'A';
+    ServiceHarness harness;
+    harness.bringUp();
+    // Three idle frames, a finger on K for ten frames, the release; the
+    // recogniser answers the first touched frame and the release.
+    std::uint32_t frame = 1;
+    auto push = [&](std::initializer_list<std::pair<int, std::int16_t>> readings) {
+        harness.push(imageReport(frame, 1000 + 10 * (frame - 1), readings));
+        ++frame;
+    };
+    for (int i = 0; i < 3; ++i) push({});
+    for (int i = 0; i < 10; ++i) push({{kPadK, 300}});
+    push({});
+    harness.push(deviceResetReport());
+    ASSERT_TRUE(harness.collector.waitFor(3));
+    harness.queue()->drain();
+    harness.tearDown();
+
+    std::vector<DeliveredEvent> events = harness.collector.events();
+    ASSERT_EQ(events.size(), 3u);
+    EXPECT_EQ(events[0].type, HidEvent::kTypeDigitizer);
+    EXPECT_EQ(events[0].phase, HidEvent::kPhaseMayBegin);
+    EXPECT_EQ(events[0].y, 1.0);  // the middle region
+    EXPECT_EQ(events[1].type, HidEvent::kTypeDigitizer);
+    EXPECT_EQ(events[1].y, 1.0);
+    EXPECT_EQ(events[2].type, HidEvent::kTypeVendorDefined);
+
+    // Frames 4 (first touch) and 14 (release) and the reset report gave the
+    // events, each stamped with the time its report was recorded.
+    PropertyValue text = harness.copyProperty("Recording");
+    VeltoTouch::PipelineRecording recording(std::string_view(text.asString()));
+    std::vector<std::uint64_t> reportTimes;
+    for (const auto& recorded : recording.frames()) reportTimes.push_back(recorded.timestampNs);
+    ASSERT_EQ(reportTimes.size(), 15u);
+    EXPECT_EQ(VeltoTouch::Util::nanosecondsFromMachTime(events[0].timeStamp), reportTimes[3]);
+    EXPECT_EQ(VeltoTouch::Util::nanosecondsFromMachTime(events[1].timeStamp), reportTimes[13]);
+    EXPECT_EQ(VeltoTouch::Util::nanosecondsFromMachTime(events[2].timeStamp), reportTimes[14]);
+}
