@@ -74,7 +74,14 @@ VeltoTouchHIDService::VeltoTouchHIDService()
 VeltoTouchHIDService::~VeltoTouchHIDService()
 {
     _log.debug("%@", "dealloc");
-    _inputReportRunLoop.reset();
+    if (_inputReportRunLoop) {
+        // The host unschedules before its last release. Should it not have,
+        // the thread must still not outlive the object it works on.
+        _inputReportRunLoop->performJob(kHandleInputReportsRunLoopMode, [] { RunLoop::stopCurrent(); });
+        _inputReportRunLoop->wakeUp();
+        _inputReportRunLoop.reset();
+        if (_inputReportThreadSignal) _inputReportThreadSignal->wait();
+    }
     _veltoDevice.reset();
 }
 

@@ -101,6 +101,7 @@ public:
     bool deviceHasCallback() const;
 
     const VeltoHost::SerialQueue::Ref& queue() const { return _queue; }
+    const std::shared_ptr<VeltoHost::SimulatedHostDevice>& device() const { return _device; }
     EventCollector collector;
 
 private:

@@ -4,6 +4,7 @@
 
 #include "platform/PropertyDictionary.h"
 #include "platform/Semaphore.h"
+#include "platform/SimulatedHostDevice.h"
 #include "platform/Trace.h"
 #include "service/ServiceHarness.h"
 
@@ -112,4 +113,25 @@ TEST(ServiceScheduling, EventsWithoutACallbackAreDropped)
     harness.queue()->drain();
     EXPECT_EQ(harness.collector.count(), 1u);
     harness.plugin().Stop(harness.pluginRef());
+}
+
+TEST(ServiceScheduling, ALastReleaseWhileScheduledEndsTheThreadFirst)
+{
+    std::shared_ptr<SimulatedHostDevice> device;
+    SerialQueue::Ref queue;
+    {
+        ServiceHarness harness;
+        harness.bringUp();
+        harness.push(deviceResetReport());
+        ASSERT_TRUE(harness.collector.waitFor(1));
+        device = harness.device();
+        queue = harness.queue();
+        // No unscheduling: the host's last release comes at once.
+    }
+    EXPECT_FALSE(device->isScheduled());
+    EXPECT_FALSE(device->hasCallback());
+    // Reports that come now are kept by the device, not processed.
+    device->pushInputReport(deviceResetReport());
+    EXPECT_EQ(device->pendingReportCount(), 1u);
+    queue->drain();
 }
