@@ -279,6 +279,8 @@ void RunLoop::removeSource(SourceId id)
     }
     guard.unlock();
     removed.reset();
+    // A run sleeping in that mode may now have nothing left to serve.
+    wakeUp();
 }
 
 }  // namespace VeltoHost

@@ -187,12 +187,16 @@ TEST(RunLoopTest, RemovingASourceFromAnotherThreadWaitsForItsCallback)
     pipe.put('r');
     callbackEntered.wait();
     std::size_t eventsWhenRemoved = 0;
+    Semaphore removing;
     std::thread remover([&] {
+        removing.signal();
         loop->removeSource(source);
         // The callback must have finished before removeSource returned.
         eventsWhenRemoved = events.size();
     });
-    // The remover is blocked until the callback ends; let the callback end.
+    // The remover is (all but certainly) blocked until the callback ends;
+    // let the callback end. Should it come late, the removal wakes the loop.
+    removing.wait();
     releaseCallback.signal();
     remover.join();
     loopThread.join();

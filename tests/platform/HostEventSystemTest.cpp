@@ -1,0 +1,187 @@
+#include "platform/HostDeviceRegistry.h"
+#include "platform/HostEventSystem.h"
+#include "platform/PropertyDictionary.h"
+#include "platform/Semaphore.h"
+#include "platform/SimulatedHostDevice.h"
+
+#include <gtest/gtest.h>
+
+#include <dlfcn.h>
+
+#include <mutex>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+using namespace VeltoHost;
+using namespace std::chrono_literals;
+
+namespace {
+
+constexpr const char* kEchoPluginPath = VELTO_ECHO_PLUGIN_PATH;
+constexpr const char* kEchoFactory = "VeltoEchoServiceFactory";
+
+// The test module's own exports, reached the way a debugger would: by
+// loading the same module again (the loader hands back the same copy).
+struct EchoModule {
+    void* handle = dlopen(kEchoPluginPath, RTLD_NOW | RTLD_LOCAL);
+    ~EchoModule()
+    {
+        if (handle) dlclose(handle);
+    }
+    int liveServices() const
+    {
+        auto function = reinterpret_cast<int (*)()>(dlsym(handle, "VeltoEchoLiveServices"));
+        return function ? function() : -1;
+    }
+    std::vector<std::string> callLog() const
+    {
+        std::vector<std::string> calls;
+        auto function = reinterpret_cast<void (*)(std::vector<std::string>*)>(dlsym(handle, "VeltoEchoCallLog"));
+        if (function) function(&calls);
+        return calls;
+    }
+    void clearCallLog() const
+    {
+        auto function = reinterpret_cast<void (*)()>(dlsym(handle, "VeltoEchoClearCallLog"));
+        if (function) function();
+    }
+};
+
+std::vector<std::string> withoutProbeDetails(std::vector<std::string> calls)
+{
+    for (std::string& call : calls) {
+        if (call.rfind("Probe", 0) == 0) call = "Probe";
+    }
+    return calls;
+}
+
+std::string runtimeErrorOf(HostEventSystem& host, const std::string& path, const std::string& factory,
+                           HostDevice::Ref device)
+{
+    try {
+        host.start(path, factory, std::move(device));
+    } catch (const std::runtime_error& error) {
+        return error.what();
+    }
+    return "no error";
+}
+
+}  // namespace
+
+TEST(HostEventSystemTest, DrivesAPluginModuleAndDeliversItsEventsToSubscribers)
+{
+    EchoModule module;
+    ASSERT_NE(module.handle, nullptr) << dlerror();
+    module.clearCallLog();
+
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+    device->setProperty("Product", PropertyValue::string("Simulated Surface"));
+    device->setProperty("VendorID", PropertyValue::uint32(0x1234));
+
+    HostEventSystem host;
+    std::mutex lock;
+    std::vector<std::vector<std::uint8_t>> payloads;  // guarded by lock
+    bool onQueue = true;                              // guarded by lock
+    Semaphore arrived;
+    host.subscribe([&](const HidEventRef& event) {
+        std::lock_guard<std::mutex> guard(lock);
+        onQueue = onQueue && host.queue()->isCurrent();
+        payloads.push_back(event->vendorDefined().payload);
+        arrived.signal();
+    });
+    int unsubscribedCalls = 0;
+    HostEventSystem::SubscriptionId dropped = host.subscribe([&](const HidEventRef&) { ++unsubscribedCalls; });
+    host.unsubscribe(dropped);
+
+    host.start(kEchoPluginPath, kEchoFactory, device, {}, 0x1);
+    ASSERT_TRUE(host.isRunning());
+    EXPECT_EQ(HostDevice::createWithService(host.service()), device);
+    EXPECT_EQ(module.liveServices(), 1);
+    EXPECT_EQ(device->counters().lastOpenOptions, 0x1u);
+
+    for (std::uint8_t i = 1; i <= 5; ++i) device->pushInputReport({i, static_cast<std::uint8_t>(i * 10)});
+    for (int i = 0; i < 5; ++i) ASSERT_TRUE(arrived.waitFor(10s));
+    host.drain();
+    {
+        std::lock_guard<std::mutex> guard(lock);
+        ASSERT_EQ(payloads.size(), 5u);
+        for (std::uint8_t i = 1; i <= 5; ++i) {
+            EXPECT_EQ(payloads[i - 1], (std::vector<std::uint8_t>{i, static_cast<std::uint8_t>(i * 10)}));
+        }
+        EXPECT_TRUE(onQueue);
+    }
+    EXPECT_EQ(host.eventsDelivered(), 5u);
+    EXPECT_EQ(unsubscribedCalls, 0);
+
+    // Properties go through the service table both ways.
+    EXPECT_TRUE(host.setProperty("Echo.Gain", PropertyValue::int32(3)));
+    EXPECT_EQ(host.copyProperty("Echo.Gain"), PropertyValue::int32(3));
+    EXPECT_EQ(host.copyProperty("Product"), PropertyValue::string("Simulated Surface"));
+    EXPECT_TRUE(host.setProperty("Product", PropertyValue::string("Renamed")));
+    EXPECT_EQ(device->getProperty("Product"), PropertyValue::string("Renamed"));
+
+    host.stop();
+    EXPECT_FALSE(host.isRunning());
+    EXPECT_FALSE(host.copyProperty("Product").hasValue());
+    EXPECT_FALSE(host.setProperty("Echo.Gain", PropertyValue::int32(1)));
+    EXPECT_EQ(module.liveServices(), 0);
+
+    SimulatedHostDevice::Counters counters = device->counters();
+    EXPECT_EQ(counters.opens, 1u);
+    EXPECT_EQ(counters.closes, 1u);
+    EXPECT_EQ(counters.schedules, 1u);
+    EXPECT_EQ(counters.unschedules, 1u);
+    EXPECT_FALSE(device->isScheduled());
+    EXPECT_FALSE(device->hasCallback());
+
+    std::vector<std::string> calls = module.callLog();
+    ASSERT_FALSE(calls.empty());
+    // Probe saw the device's matching properties.
+    EXPECT_NE(calls[2].find("Simulated Surface"), std::string::npos) << calls[2];
+    EXPECT_EQ(withoutProbeDetails(calls),
+              (std::vector<std::string>{"create", "QueryInterface", "Probe", "Start", "open", "setEventCallback",
+                                        "scheduleWithDispatchQueue", "unscheduleFromDispatchQueue", "close",
+                                        "Stop", "Release", "Release", "dealloc"}));
+}
+
+TEST(HostEventSystemTest, StartFailuresRaiseClearErrorsAndUndoEverything)
+{
+    EchoModule module;
+    ASSERT_NE(module.handle, nullptr) << dlerror();
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+    HostEventSystem host;
+
+    std::string error = runtimeErrorOf(host, "/nonexistent/velto_plugin.so", kEchoFactory, device);
+    EXPECT_NE(error.find("cannot load plug-in module /nonexistent/velto_plugin.so"), std::string::npos) << error;
+
+    error = runtimeErrorOf(host, kEchoPluginPath, "VeltoTouchHIDServiceFactory", device);
+    EXPECT_NE(error.find("factory VeltoTouchHIDServiceFactory not found"), std::string::npos) << error;
+
+    error = runtimeErrorOf(host, kEchoPluginPath, "VeltoEchoPluginOnlyFactory", device);
+    EXPECT_NE(error.find("does not serve the HID service interface (status 0x80000004)"), std::string::npos)
+        << error;
+    EXPECT_EQ(module.liveServices(), 0);
+
+    // Open fails after start: the plug-in is stopped and released again.
+    module.clearCallLog();
+    device->failOpen(true);
+    error = runtimeErrorOf(host, kEchoPluginPath, kEchoFactory, device);
+    EXPECT_EQ(error, "plug-in could not open the device");
+    EXPECT_FALSE(host.isRunning());
+    EXPECT_EQ(host.service(), 0u);
+    EXPECT_EQ(module.liveServices(), 0);
+    EXPECT_EQ(withoutProbeDetails(module.callLog()),
+              (std::vector<std::string>{"create", "QueryInterface", "Probe", "Start", "open", "Stop", "Release",
+                                        "Release", "dealloc"}));
+
+    // The same host starts cleanly once the device behaves.
+    device->failOpen(false);
+    host.start(kEchoPluginPath, kEchoFactory, device);
+    EXPECT_TRUE(host.isRunning());
+    std::uint32_t service = host.service();
+    host.stop();
+    EXPECT_EQ(HostDevice::createWithService(service), nullptr);
+    EXPECT_EQ(module.liveServices(), 0);
+    EXPECT_THROW(host.start(kEchoPluginPath, kEchoFactory, nullptr), std::runtime_error);
+}
