@@ -17,6 +17,7 @@
 #include "platform/MonotonicClock.h"
 #include "platform/PropertyDictionary.h"
 #include "platform/PropertyValue.h"
+#include "platform/RunLoop.h"
 #include "platform/Semaphore.h"
 #include "platform/SerialQueue.h"
 #include "platform/SimulatedHostDevice.h"
@@ -104,6 +105,73 @@ void BM_HandOffFloor(benchmark::State& state)
             done.wait();
         }
         receiver.join();
+        reportPercentiles(state, samples, "");
+        state.counters["real_time"] = schedulingError == 0 ? 1 : 0;
+    }
+}
+
+// The host's own path without the service: the simulated device delivers to
+// a plain thread running its event loop, whose callback hands one job to a
+// serial queue. The same two thread crossings as the service's path, with
+// nothing in between; what the service adds is the difference. With the
+// argument 1 the loop's thread asks for real-time priority like the service's.
+void BM_HostPathFloor(benchmark::State& state)
+{
+    const bool realTime = state.range(0) != 0;
+    int schedulingError = -1;
+    static constexpr const char* kMode = "bench";
+    struct Context {
+        SerialQueue::Ref queue;
+        Semaphore delivered;
+        std::atomic<std::uint64_t> deliveredAt{0};
+    };
+    for (auto _ : state) {
+        SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+        Context context;
+        context.queue = SerialQueue::create("bench.floor");
+        device->open(0);
+        Semaphore started;
+        Semaphore ended;
+        RunLoop::Ref loop;
+        std::vector<std::uint8_t> buffer(VeltoTouchHIDService::kInputReportBufferSize);
+        Thread::startDetached([&] {
+            if (realTime) {
+                schedulingError = Thread::setCurrentScheduling(VeltoTouchHIDService::kInputReportThreadPolicy,
+                                                               VeltoTouchHIDService::kInputReportThreadPriority);
+            }
+            loop = RunLoop::current();
+            device->registerInputReportWithTimeStampCallback(
+                buffer.data(), buffer.size(),
+                [](void* target, std::int32_t, void*, HidReportType, std::uint32_t, std::uint8_t*, std::size_t,
+                   std::uint64_t) {
+                    auto* ctx = static_cast<Context*>(target);
+                    ctx->queue->async([ctx] {
+                        ctx->deliveredAt.store(MonotonicClock::now(), std::memory_order_release);
+                        ctx->delivered.signal();
+                    });
+                },
+                &context);
+            device->scheduleWithRunLoop(loop, kMode);
+            started.signal();
+            while (RunLoop::run(kMode, std::nullopt, true) == RunLoop::RunResult::HandledSource) {
+            }
+            device->unscheduleFromRunLoop(loop, kMode);
+            device->registerInputReportWithTimeStampCallback(buffer.data(), buffer.size(), nullptr, nullptr);
+            ended.signal();
+        });
+        started.wait();
+        std::vector<std::uint64_t> samples;
+        samples.reserve(kSamples);
+        for (int i = 0; i < kSamples; ++i) {
+            MonotonicClock::sleepMicroseconds(kSpacingMicroseconds);
+            std::uint64_t pushed = MonotonicClock::now();
+            device->pushInputReport(deviceResetReport());
+            context.delivered.wait();
+            samples.push_back(context.deliveredAt.load(std::memory_order_acquire) - pushed);
+        }
+        loop->performJob(kMode, [] { RunLoop::stopCurrent(); });
+        ended.wait();
+        context.queue->drain();
         reportPercentiles(state, samples, "");
         state.counters["real_time"] = schedulingError == 0 ? 1 : 0;
     }
@@ -272,6 +340,7 @@ void BM_ServiceStallDuringRecordingReads(benchmark::State& state)
 }  // namespace
 
 BENCHMARK(BM_HandOffFloor)->Arg(0)->Arg(1)->Iterations(1)->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_HostPathFloor)->Arg(0)->Arg(1)->Iterations(1)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_ServiceReportToCallback)->Iterations(1)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_ServiceStallDuringRecordingReads)->Arg(0)->Arg(1)->Iterations(1)->Unit(benchmark::kMillisecond);
 
