@@ -242,21 +242,3 @@ TEST(PluginInterface, TablesForwardEachSlotWithTheOperationsArgumentOrder)
     EXPECT_TRUE(aliveDuringCall);
     EXPECT_TRUE(destroyed);
 }
-
-TEST(PluginInterface, BaseServiceRefusesEveryOperation)
-{
-    auto* service = new VeltoHIDService();
-    VeltoInterfaceRef plugin = service->getPluginInterface();
-    VeltoInterfaceRef svc = service->getServiceInterface();
-    std::int32_t score = 1;
-    EXPECT_EQ(pluginTable(plugin).Probe(plugin, {}, 1, &score), kVeltoUnsupported);
-    EXPECT_EQ(pluginTable(plugin).Start(plugin, {}, 1), kVeltoUnsupported);
-    EXPECT_EQ(pluginTable(plugin).Stop(plugin), kVeltoUnsupported);
-    EXPECT_FALSE(serviceTable(svc).open(svc, 0));
-    EXPECT_FALSE(serviceTable(svc).copyProperty(svc, "Version").hasValue());
-    EXPECT_FALSE(serviceTable(svc).setProperty(svc, "Version", PropertyValue::int32(1)));
-    EXPECT_EQ(serviceTable(svc).copyEvent(svc, 1, nullptr, 0), nullptr);
-    EXPECT_EQ(serviceTable(svc).setOutputEvent(svc, nullptr), kVeltoUnsupported);
-    EXPECT_EQ(score, 1);
-    EXPECT_EQ(pluginTable(plugin).Release(plugin), 0u);
-}
