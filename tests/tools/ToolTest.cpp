@@ -229,3 +229,61 @@ TEST(Tool, DumpDrawsTheChosenFrames)
     EXPECT_EQ(runTool({"dump", file, "--frames", "x"}).err,
               "veltotouch: invalid frame range \"x\" (expected A:B with frame numbers)\n");
 }
+
+namespace {
+
+// Gesture, region and frame of each event line of --jsonl output; time stamps
+// differ between runs and are left out.
+std::vector<std::string> eventsOf(const std::string& jsonLines)
+{
+    std::vector<std::string> out;
+    std::istringstream text(jsonLines);
+    for (std::string line; std::getline(text, line);) {
+        auto json = nlohmann::json::parse(line);
+        if (!json.contains("gesture")) continue;
+        out.push_back(json["gesture"].get<std::string>() + " " + json.value("region", "") + " " +
+                      std::to_string(json.value("frame", 0)));
+    }
+    return out;
+}
+
+}  // namespace
+
+TEST(Tool, HostWithTheSimulatedDeviceGivesTheSameGesturesAsReplay)
+{
+    TempDir dir;
+    const std::string demo = std::string(VELTO_EXAMPLES_DIR) + "/demo.json";
+    const fs::path saved = dir.file("saved.json");
+    ToolRun host = runTool({"host", "--device", "sim:" + demo, "--speed", "0", "--jsonl", "--set",
+                            "Pipeline.Algs.HoldTimeoutMilliseconds=500", "--get", "Pipeline.DebugInfo",
+                            "--save-recording", saved.string()});
+    ASSERT_EQ(host.status, 0) << host.err;
+    ToolRun replay = runTool({"replay", demo, "--jsonl"});
+    ASSERT_EQ(replay.status, 0) << replay.err;
+
+    const auto hostEvents = eventsOf(host.out);
+    EXPECT_EQ(hostEvents, eventsOf(replay.out));
+    EXPECT_GE(hostEvents.size(), 10u);
+    EXPECT_NE(host.out.find(R"({"key":"Pipeline.DebugInfo","value":{"ResetCount":1,"DisjointImageCount":0}})"),
+              std::string::npos);
+
+    // The plug-in's own recording holds the setting (without its domain) and
+    // every report, and replays to the same gestures once more.
+    const std::string recording = readFile(saved);
+    EXPECT_NE(recording.find("\"Key\": \"Algs.HoldTimeoutMilliseconds\""), std::string::npos);
+    ToolRun again = runTool({"replay", saved.string(), "--jsonl"});
+    ASSERT_EQ(again.status, 0) << again.err;
+    EXPECT_EQ(eventsOf(again.out), hostEvents);
+}
+
+TEST(Tool, HostReportsWhatItCannotStart)
+{
+    const std::string taps = std::string(VELTO_EXAMPLES_DIR) + "/taps.json";
+    ToolRun noPlugin = runTool({"host", "--device", "sim:" + taps, "--plugin", "/nonexistent/plugin.so"});
+    EXPECT_EQ(noPlugin.status, 1);
+    EXPECT_NE(noPlugin.err.find("cannot load plug-in module /nonexistent/plugin.so"), std::string::npos);
+
+    ToolRun noRecording = runTool({"host", "--device", "sim:/nonexistent.json"});
+    EXPECT_EQ(noRecording.status, 1);
+    EXPECT_EQ(noRecording.err, "veltotouch: /nonexistent.json: No such file or directory\n");
+}
