@@ -22,8 +22,8 @@ namespace VeltoHost {
 // scheduled mode, one report per handled source, in push order, each copied
 // into the registered buffer (truncated to its size) with the clock reading
 // taken at the push as its time stamp. Reports pushed while the device is not
-// scheduled or has no callback are kept, up to kMaxPendingReports, and
-// delivered once both are in place: the host schedules the device from
+// open, not scheduled or has no callback are kept, up to kMaxPendingReports,
+// and delivered once all three hold: the host schedules the device from
 // another thread than the one pushing, and a test must not lose the reports
 // it pushed right after scheduling. Beyond the limit the oldest report is
 // dropped, as a device's own buffer would overflow. unplug() ends delivery
