@@ -48,17 +48,17 @@ namespace {
 
 // Appends snprintf output of any length.
 template <typename... V>
-void appendFormatted(std::string& out, const char* spec, V... values)
+void appendFormatted(std::string& out, const char* pattern, V... values)
 {
     char buffer[128];
-    int needed = std::snprintf(buffer, sizeof buffer, spec, values...);
+    int needed = std::snprintf(buffer, sizeof buffer, pattern, values...);
     if (needed < 0) return;
     if (static_cast<std::size_t>(needed) < sizeof buffer) {
         out.append(buffer, static_cast<std::size_t>(needed));
         return;
     }
     std::vector<char> large(static_cast<std::size_t>(needed) + 1);
-    std::snprintf(large.data(), large.size(), spec, values...);
+    std::snprintf(large.data(), large.size(), pattern, values...);
     out.append(large.data(), static_cast<std::size_t>(needed));
 }
 
@@ -94,12 +94,12 @@ private:
             out += '%';
             return p + 1;
         }
-        std::string spec = "%";
-        while (*p && std::strchr("-+ #0", *p)) spec += *p++;
-        p = number(p, spec);
+        std::string pattern = "%";
+        while (*p && std::strchr("-+ #0", *p)) pattern += *p++;
+        p = number(p, pattern);
         if (*p == '.') {
-            spec += *p++;
-            p = number(p, spec);
+            pattern += *p++;
+            p = number(p, pattern);
         }
         bool wide = false;
         while (*p && std::strchr("hlLjztq", *p)) {
@@ -111,23 +111,23 @@ private:
             return p;
         }
         char conversion = *p++;
-        convert(conversion, spec, wide, out);
+        convert(conversion, pattern, wide, out);
         return p;
     }
 
     // Copies a width or precision, resolving '*' from the argument list.
-    const char* number(const char* p, std::string& spec)
+    const char* number(const char* p, std::string& pattern)
     {
         if (*p == '*') {
             const LogFormatArg* arg = take();
-            spec += std::to_string(arg ? static_cast<int>(arg->asSigned()) : 0);
+            pattern += std::to_string(arg ? static_cast<int>(arg->asSigned()) : 0);
             return p + 1;
         }
-        while (*p >= '0' && *p <= '9') spec += *p++;
+        while (*p >= '0' && *p <= '9') pattern += *p++;
         return p;
     }
 
-    void convert(char conversion, std::string spec, bool wide, std::string& out)
+    void convert(char conversion, std::string pattern, bool wide, std::string& out)
     {
         const LogFormatArg* arg = take();
         if (!arg) {
@@ -138,9 +138,9 @@ private:
         case 'd':
         case 'i':
             if (wide) {
-                appendFormatted(out, (spec + "lld").c_str(), static_cast<long long>(arg->asSigned()));
+                appendFormatted(out, (pattern + "lld").c_str(), static_cast<long long>(arg->asSigned()));
             } else {
-                appendFormatted(out, (spec + "d").c_str(), static_cast<int>(static_cast<std::uint32_t>(arg->asUnsigned())));
+                appendFormatted(out, (pattern + "d").c_str(), static_cast<int>(static_cast<std::uint32_t>(arg->asUnsigned())));
             }
             break;
         case 'u':
@@ -148,13 +148,13 @@ private:
         case 'X':
         case 'o':
             if (wide) {
-                appendFormatted(out, (spec + "ll" + conversion).c_str(), static_cast<unsigned long long>(arg->asUnsigned()));
+                appendFormatted(out, (pattern + "ll" + conversion).c_str(), static_cast<unsigned long long>(arg->asUnsigned()));
             } else {
-                appendFormatted(out, (spec + conversion).c_str(), static_cast<unsigned>(arg->asUnsigned()));
+                appendFormatted(out, (pattern + conversion).c_str(), static_cast<unsigned>(arg->asUnsigned()));
             }
             break;
         case 'c':
-            appendFormatted(out, (spec + "c").c_str(), static_cast<int>(static_cast<unsigned char>(arg->asSigned())));
+            appendFormatted(out, (pattern + "c").c_str(), static_cast<int>(static_cast<unsigned char>(arg->asSigned())));
             break;
         case 'f':
         case 'F':
@@ -164,14 +164,14 @@ private:
         case 'G':
         case 'a':
         case 'A':
-            appendFormatted(out, (spec + conversion).c_str(), arg->asReal());
+            appendFormatted(out, (pattern + conversion).c_str(), arg->asReal());
             break;
         case 's':
         case '@':
-            appendFormatted(out, (spec + "s").c_str(), arg->asText().c_str());
+            appendFormatted(out, (pattern + "s").c_str(), arg->asText().c_str());
             break;
         default:
-            out += spec;
+            out += pattern;
             out += conversion;
             break;
         }
