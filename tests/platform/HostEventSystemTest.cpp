@@ -184,4 +184,14 @@ TEST(HostEventSystemTest, StartFailuresRaiseClearErrorsAndUndoEverything)
     EXPECT_EQ(HostDevice::createWithService(service), nullptr);
     EXPECT_EQ(module.liveServices(), 0);
     EXPECT_THROW(host.start(kEchoPluginPath, kEchoFactory, nullptr), std::runtime_error);
+
+    // A host that goes away while running shuts the plug-in down first.
+    {
+        HostEventSystem scoped;
+        scoped.start(kEchoPluginPath, kEchoFactory, device);
+        device->pushInputReport({0x01});
+        EXPECT_EQ(module.liveServices(), 1);
+    }
+    EXPECT_EQ(module.liveServices(), 0);
+    EXPECT_FALSE(device->isScheduled());
 }

@@ -155,6 +155,7 @@ TEST(RunLoopTest, DescriptorSourcesFireOnTheLoopThreadInTheirModeOnly)
 
         // Nothing readable in M any more: a zero time limit only polls.
         EXPECT_EQ(RunLoop::run("M", 0ns, true), RunLoop::RunResult::TimedOut);
+        EXPECT_EQ(RunLoop::run("M", 1ms, false), RunLoop::RunResult::TimedOut);
         EXPECT_EQ(RunLoop::run("Other", 0ns, true), RunLoop::RunResult::HandledSource);
         EXPECT_TRUE(otherFired);
     });
