@@ -12,6 +12,7 @@
 // Reports are spaced so that every thread is asleep when the next one comes,
 // as with the real device's frame rate; each benchmark runs its samples once
 // and reports percentiles as counters in microseconds.
+#include "pipeline/InputReport.h"
 #include "platform/HostDeviceRegistry.h"
 #include "platform/Log.h"
 #include "platform/MonotonicClock.h"
@@ -63,13 +64,10 @@ std::vector<std::uint8_t> deviceResetReport() { return {0x02, 0x00, 0, 0, 0, 0, 
 
 std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber)
 {
-    std::vector<std::uint8_t> bytes(73, 0);
-    bytes[0] = 0x01;
-    for (int i = 0; i < 4; ++i) {
-        bytes[1 + i] = static_cast<std::uint8_t>(frameNumber >> (8 * i));
-        bytes[5 + i] = static_cast<std::uint8_t>((frameNumber * 8) >> (8 * i));
-    }
-    return bytes;
+    VeltoTouch::InputReport::Image image;
+    image.frameNumber = frameNumber;
+    image.timeMs = frameNumber * 8;
+    return image.toReport();
 }
 
 // The floor: one thread wakes another through a semaphore, the same kind of

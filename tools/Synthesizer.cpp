@@ -1,6 +1,9 @@
 #include "Synthesizer.h"
 
+#include "pipeline/InputReport.h"
+
 #include <algorithm>
+#include <cstdlib>
 
 namespace VeltoTool {
 
@@ -78,28 +81,23 @@ void Synthesizer::touch(const GestureScript::Step& step)
 
 void Synthesizer::resetReport()
 {
-    // The firmware's reset notice: event code 0 and no context.
-    appendReport({0x02, 0x00, 0, 0, 0, 0, 0, 0, 0, 0});
+    // The firmware's reset notice, without context.
+    VeltoTouch::InputReport::FirmwareEvent reset;
+    reset.event = VeltoTouch::InputReport::FirmwareEvent::kEventDeviceReset;
+    appendReport(reset.toReport());
 }
 
 void Synthesizer::appendImage(const ContactModel::Readings& readings)
 {
-    std::vector<std::uint8_t> report(73, 0);
-    report[0] = 0x01;
-    for (int i = 0; i < 4; ++i) {
-        report[1 + i] = static_cast<std::uint8_t>(_frameNumber >> (8 * i));
-        report[5 + i] = static_cast<std::uint8_t>(_timeMs >> (8 * i));
-    }
+    VeltoTouch::InputReport::Image image;
+    image.frameNumber = _frameNumber;
+    image.timeMs = _timeMs;
+    image.readings = readings;
+    // Levels carry the raw magnitude; only the dump shows them.
     for (std::size_t pad = 0; pad < readings.size(); ++pad) {
-        // Levels carry the raw magnitude; only the dump shows them.
-        const auto level = static_cast<std::uint16_t>(std::abs(static_cast<int>(readings[pad])));
-        const auto reading = static_cast<std::uint16_t>(readings[pad]);
-        report[13 + 2 * pad] = static_cast<std::uint8_t>(level);
-        report[14 + 2 * pad] = static_cast<std::uint8_t>(level >> 8);
-        report[43 + 2 * pad] = static_cast<std::uint8_t>(reading);
-        report[44 + 2 * pad] = static_cast<std::uint8_t>(reading >> 8);
+        image.levels[pad] = static_cast<std::uint16_t>(std::abs(static_cast<int>(readings[pad])));
     }
-    appendReport(std::move(report));
+    appendReport(image.toReport());
     ++_frameNumber;
     _timeMs += _framePeriodMs;
 }

@@ -2,6 +2,8 @@
 
 #include "pipeline/LittleEndian.h"
 
+#include <algorithm>
+
 namespace VeltoTouch::InputReport {
 
 std::optional<Image> Image::parse(const std::uint8_t* data, std::size_t length) noexcept
@@ -21,6 +23,23 @@ std::optional<Image> Image::parse(const std::uint8_t* data, std::size_t length) 
     return image;
 }
 
+std::vector<std::uint8_t> Image::toReport() const
+{
+    std::vector<std::uint8_t> report(kLength, 0);
+    report[0] = kReportID;
+    LittleEndian::putU32(&report[1], frameNumber);
+    LittleEndian::putU32(&report[5], timeMs);
+    report[9] = aux0;
+    report[10] = aux1;
+    report[11] = aux2;
+    report[12] = aux3;
+    for (std::size_t pad = 0; pad < kPadCount; ++pad) {
+        LittleEndian::putU16(&report[13 + 2 * pad], levels[pad]);
+        LittleEndian::putU16(&report[43 + 2 * pad], static_cast<std::uint16_t>(readings[pad]));
+    }
+    return report;
+}
+
 std::uint64_t FirmwareEvent::contextValue() const noexcept
 {
     std::uint64_t value = 0;
@@ -35,6 +54,15 @@ std::optional<FirmwareEvent> FirmwareEvent::parse(const std::uint8_t* data, std:
     event.event = data[1];
     for (std::size_t i = 0; i < event.context.size(); ++i) event.context[i] = data[2 + i];
     return event;
+}
+
+std::vector<std::uint8_t> FirmwareEvent::toReport() const
+{
+    std::vector<std::uint8_t> report(kLength, 0);
+    report[0] = kReportID;
+    report[1] = event;
+    std::copy(context.begin(), context.end(), report.begin() + 2);
+    return report;
 }
 
 }  // namespace VeltoTouch::InputReport

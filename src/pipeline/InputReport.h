@@ -4,6 +4,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <optional>
+#include <vector>
 
 namespace VeltoTouch::InputReport {
 
@@ -26,6 +27,9 @@ struct Image {
     // A record when the buffer holds at least kLength bytes and starts with
     // kReportID; bytes past kLength are ignored. Reads nothing when too short.
     static std::optional<Image> parse(const std::uint8_t* data, std::size_t length) noexcept;
+    // The kLength report bytes that parse back to this record, as a device
+    // would send them; for simulated devices and tests.
+    std::vector<std::uint8_t> toReport() const;
 };
 
 // A notice from the device firmware. Report ID 0x02, 10 bytes.
@@ -43,6 +47,7 @@ struct FirmwareEvent {
     std::uint64_t contextValue() const noexcept;
 
     static std::optional<FirmwareEvent> parse(const std::uint8_t* data, std::size_t length) noexcept;
+    std::vector<std::uint8_t> toReport() const;
 };
 
 }  // namespace VeltoTouch::InputReport

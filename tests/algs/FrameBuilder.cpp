@@ -6,17 +6,6 @@ using VeltoHost::HidEvent;
 
 namespace {
 
-void putU16(std::vector<std::uint8_t>& bytes, std::size_t offset, std::uint16_t value)
-{
-    bytes[offset] = static_cast<std::uint8_t>(value & 0xFF);
-    bytes[offset + 1] = static_cast<std::uint8_t>(value >> 8);
-}
-
-void putU32(std::vector<std::uint8_t>& bytes, std::size_t offset, std::uint32_t value)
-{
-    for (std::size_t i = 0; i < 4; ++i) bytes[offset + i] = static_cast<std::uint8_t>(value >> (8 * i));
-}
-
 const char* phaseName(std::uint16_t phase, std::uint32_t eventMask)
 {
     switch (phase) {
@@ -53,13 +42,12 @@ void FrameBuilder::setContact(const Contact& contact)
 
 std::vector<std::uint8_t> FrameBuilder::next()
 {
-    std::vector<std::uint8_t> bytes(InputReport::Image::kLength, 0);
-    bytes[0] = InputReport::Image::kReportID;
-    putU32(bytes, 1, _frameNumber++);
-    putU32(bytes, 5, _timeMs);
+    InputReport::Image image;
+    image.frameNumber = _frameNumber++;
+    image.timeMs = _timeMs;
+    image.readings = _readings;
     _timeMs += _intervalMs;
-    for (std::size_t i = 0; i < _readings.size(); ++i) putU16(bytes, 43 + 2 * i, static_cast<std::uint16_t>(_readings[i]));
-    return bytes;
+    return image.toReport();
 }
 
 PipelineHarness::PipelineHarness()

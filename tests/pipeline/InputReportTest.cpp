@@ -1,4 +1,3 @@
-#include "ReportBytes.h"
 #include "pipeline/FeatureReport.h"
 #include "pipeline/InputReport.h"
 
@@ -43,9 +42,21 @@ TEST(InputReport, ImageParsesEveryFieldAtItsOffset)
     EXPECT_FALSE(InputReport::Image::parse(bytes.data(), 73));
 }
 
+TEST(InputReport, RecordsEncodeToTheBytesTheyParseFrom)
+{
+    std::vector<std::uint8_t> bytes(73);
+    for (std::size_t i = 0; i < bytes.size(); ++i) bytes[i] = static_cast<std::uint8_t>(i * 7 + 3);
+    bytes[0] = 0x01;
+    EXPECT_EQ(InputReport::Image::parse(bytes.data(), bytes.size())->toReport(), bytes);
+
+    const std::vector<std::uint8_t> reset{0x02, 0x00, 8, 7, 6, 5, 4, 3, 2, 1};
+    EXPECT_EQ(InputReport::FirmwareEvent::parse(reset.data(), reset.size())->toReport(), reset);
+}
+
 TEST(InputReport, FirmwareEventAndFeatureReportBoundaries)
 {
-    auto bytes = ReportBytes::firmwareEvent(0, {1, 2, 3, 4, 5, 6, 7, 8});
+    // Written out by hand, so that the layout is checked independently of the encoder.
+    const std::vector<std::uint8_t> bytes{0x02, 0x00, 1, 2, 3, 4, 5, 6, 7, 8};
     auto event = InputReport::FirmwareEvent::parse(bytes.data(), bytes.size());
     ASSERT_TRUE(event);
     EXPECT_EQ(event->event, 0);

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "pipeline/InputReport.h"
 #include "pipeline/PipelineInput.h"
 #include "recording/PipelineRecording.h"
 
@@ -15,22 +16,15 @@ using VeltoTouch::PipelineRecording;
 using VeltoTouch::PropertyValue;
 using Frame = PipelineRecording::Frame;
 
-// Raw image report: ID 0x01, 73 bytes, frame number and time little-endian.
+// Raw image report with the given pad readings.
 inline std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs,
                                              const std::array<std::int16_t, 15>& readings = {})
 {
-    std::vector<std::uint8_t> bytes(73, 0);
-    bytes[0] = 0x01;
-    for (int i = 0; i < 4; ++i) {
-        bytes[1 + i] = static_cast<std::uint8_t>(frameNumber >> (8 * i));
-        bytes[5 + i] = static_cast<std::uint8_t>(timeMs >> (8 * i));
-    }
-    for (int pad = 0; pad < 15; ++pad) {
-        auto value = static_cast<std::uint16_t>(readings[pad]);
-        bytes[43 + 2 * pad] = static_cast<std::uint8_t>(value);
-        bytes[44 + 2 * pad] = static_cast<std::uint8_t>(value >> 8);
-    }
-    return bytes;
+    VeltoTouch::InputReport::Image image;
+    image.frameNumber = frameNumber;
+    image.timeMs = timeMs;
+    image.readings = readings;
+    return image.toReport();
 }
 
 // Firmware event report: ID 0x02, event code, 8 context bytes. Code 0 is a

@@ -1,5 +1,6 @@
 #include "service/ServiceHarness.h"
 
+#include "pipeline/InputReport.h"
 #include "platform/HostDeviceRegistry.h"
 #include "platform/MonotonicClock.h"
 #include "platform/PropertyDictionary.h"
@@ -155,9 +156,12 @@ bool ServiceHarness::deviceHasCallback() const { return _device->hasCallback(); 
 
 std::vector<std::uint8_t> firmwareEventReport(std::uint8_t code, std::uint64_t context)
 {
-    std::vector<std::uint8_t> bytes{0x02, code};
-    for (int shift = 56; shift >= 0; shift -= 8) bytes.push_back(static_cast<std::uint8_t>(context >> shift));
-    return bytes;
+    InputReport::FirmwareEvent event{code, {}};
+    // Diagnostics read the context as one number, first byte most significant.
+    for (std::size_t i = 0; i < event.context.size(); ++i) {
+        event.context[i] = static_cast<std::uint8_t>(context >> (8 * (event.context.size() - 1 - i)));
+    }
+    return event.toReport();
 }
 
 std::vector<std::uint8_t> deviceResetReport(std::uint64_t context) { return firmwareEventReport(0, context); }
@@ -165,20 +169,11 @@ std::vector<std::uint8_t> deviceResetReport(std::uint64_t context) { return firm
 std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs,
                                       std::initializer_list<std::pair<int, std::int16_t>> readings)
 {
-    // ID, frame number and time little-endian, then (at 43) one signed
-    // 16-bit reading per pad.
-    std::vector<std::uint8_t> bytes(73, 0);
-    bytes[0] = 0x01;
-    for (int i = 0; i < 4; ++i) {
-        bytes[1 + i] = static_cast<std::uint8_t>(frameNumber >> (8 * i));
-        bytes[5 + i] = static_cast<std::uint8_t>(timeMs >> (8 * i));
-    }
-    for (const auto& [pad, reading] : readings) {
-        auto value = static_cast<std::uint16_t>(reading);
-        bytes[static_cast<std::size_t>(43 + 2 * pad)] = static_cast<std::uint8_t>(value);
-        bytes[static_cast<std::size_t>(44 + 2 * pad)] = static_cast<std::uint8_t>(value >> 8);
-    }
-    return bytes;
+    InputReport::Image image;
+    image.frameNumber = frameNumber;
+    image.timeMs = timeMs;
+    for (const auto& [pad, reading] : readings) image.readings.at(static_cast<std::size_t>(pad)) = reading;
+    return image.toReport();
 }
 
 }  // namespace VeltoTouch::Test
