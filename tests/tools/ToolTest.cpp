@@ -1,4 +1,5 @@
 #include "Cli.h"
+#include "ToolTestSupport.h"
 #include "GestureScript.h"
 #include "SynthCommand.h"
 #include "ToolError.h"
@@ -14,50 +15,9 @@
 
 namespace fs = std::filesystem;
 using namespace VeltoTool;
+using namespace VeltoTool::Testing;
 
 namespace {
-
-struct ToolRun {
-    int status;
-    std::string out;
-    std::string err;
-};
-
-ToolRun runTool(std::vector<std::string> arguments)
-{
-    arguments.insert(arguments.begin(), "veltotouch");
-    std::vector<const char*> argv;
-    for (const std::string& argument : arguments) argv.push_back(argument.c_str());
-    std::ostringstream out, err;
-    int status = Cli::run(static_cast<int>(argv.size()), argv.data(), out, err);
-    return {status, out.str(), err.str()};
-}
-
-std::string readFile(const fs::path& path)
-{
-    std::ifstream in(path);
-    std::ostringstream text;
-    text << in.rdbuf();
-    return text.str();
-}
-
-class TempDir {
-public:
-    TempDir() : _path(fs::temp_directory_path() / ("veltotouch-test-" + std::to_string(::getpid())))
-    {
-        fs::create_directories(_path);
-    }
-    ~TempDir() { fs::remove_all(_path); }
-    fs::path file(const std::string& name, const std::string& text = {}) const
-    {
-        fs::path path = _path / name;
-        if (!text.empty()) std::ofstream(path) << text;
-        return path;
-    }
-
-private:
-    fs::path _path;
-};
 
 // Gesture names of a replay, one per event.
 std::vector<std::string> gesturesOf(const std::string& script)
@@ -230,24 +190,6 @@ TEST(Tool, DumpDrawsTheChosenFrames)
               "veltotouch: invalid frame range \"x\" (expected A:B with frame numbers)\n");
 }
 
-namespace {
-
-// Gesture, region and frame of each event line of --jsonl output; time stamps
-// differ between runs and are left out.
-std::vector<std::string> eventsOf(const std::string& jsonLines)
-{
-    std::vector<std::string> out;
-    std::istringstream text(jsonLines);
-    for (std::string line; std::getline(text, line);) {
-        auto json = nlohmann::json::parse(line);
-        if (!json.contains("gesture")) continue;
-        out.push_back(json["gesture"].get<std::string>() + " " + json.value("region", "") + " " +
-                      std::to_string(json.value("frame", 0)));
-    }
-    return out;
-}
-
-}  // namespace
 
 TEST(Tool, HostWithTheSimulatedDeviceGivesTheSameGesturesAsReplay)
 {
