@@ -65,6 +65,14 @@ void HostEventSystem::start(const std::string& modulePath, const std::string& fa
     }
 }
 
+void HostEventSystem::unschedule()
+{
+    if (!_scheduled) return;
+    serviceTable().unscheduleFromDispatchQueue(_serviceInterface, _queue.get());
+    _scheduled = false;
+    _queue->drain();
+}
+
 void HostEventSystem::stop()
 {
     shutDown();

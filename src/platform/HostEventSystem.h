@@ -23,7 +23,8 @@ namespace VeltoHost {
 // start() loads the module (dlopen by path), finds the factory by its
 // exported name, creates the plug-in, queries the service interface,
 // registers the device for a service handle and calls Probe, Start, open,
-// setEventCallback and scheduleWithDispatchQueue. stop() unschedules, closes,
+// setEventCallback and scheduleWithDispatchQueue. stop() unschedules (unless
+// unschedule() already did), closes,
 // stops, releases every reference obtained, waits for the queue to run the
 // plug-in's delivery jobs and closes the module. Failures in start() raise
 // std::runtime_error after undoing what was done.
@@ -48,6 +49,12 @@ public:
     // the device's "VendorID", "ProductID", "Product" and "Transport".
     void start(const std::string& modulePath, const std::string& factoryName, HostDevice::Ref device,
                PropertyValue properties = {}, std::uint32_t openOptions = 0);
+    // Ends the flow of reports without ending the plug-in: unschedules it from
+    // its queue (its input-report thread stops taking reports) and waits for
+    // the deliveries queued so far. Properties stay readable, so a host can
+    // read the final state of exactly what was processed; stop() then
+    // closes, stops and releases. Nothing happens when not scheduled.
+    void unschedule();
     void stop();
     bool isRunning() const noexcept { return _serviceInterface != nullptr; }
 

@@ -8,6 +8,7 @@
 
 #include <dlfcn.h>
 
+#include <atomic>
 #include <mutex>
 #include <stdexcept>
 #include <string>
@@ -194,4 +195,38 @@ TEST(HostEventSystemTest, StartFailuresRaiseClearErrorsAndUndoEverything)
     }
     EXPECT_EQ(module.liveServices(), 0);
     EXPECT_FALSE(device->isScheduled());
+}
+
+TEST(HostEventSystemTest, UnschedulingEndsTheReportsButKeepsPropertiesUntilStop)
+{
+    EchoModule module;
+    ASSERT_NE(module.handle, nullptr) << dlerror();
+    module.clearCallLog();
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+    HostEventSystem host;
+    std::atomic<int> events{0};
+    host.subscribe([&](const HidEventRef&) { ++events; });
+    host.start(kEchoPluginPath, kEchoFactory, device);
+
+    device->pushInputReport({0x01});
+    ASSERT_TRUE(device->waitUntilIdle());
+    host.unschedule();
+    // Every delivery queued before unscheduling has run when it returns.
+    EXPECT_EQ(events.load(), 1);
+    EXPECT_FALSE(device->isScheduled());
+
+    // Reports pushed now stay with the device; the plug-in still answers.
+    device->pushInputReport({0x02});
+    EXPECT_EQ(device->pendingReportCount(), 1u);
+    EXPECT_TRUE(host.setProperty("Echo.Gain", PropertyValue::int32(2)));
+    EXPECT_EQ(host.copyProperty("Echo.Gain"), PropertyValue::int32(2));
+
+    host.unschedule();  // a second call changes nothing
+    host.stop();
+    EXPECT_EQ(events.load(), 1);
+    EXPECT_EQ(device->counters().unschedules, 1u);
+    EXPECT_EQ(withoutProbeDetails(module.callLog()),
+              (std::vector<std::string>{"create", "QueryInterface", "Probe", "Start", "open", "setEventCallback",
+                                        "scheduleWithDispatchQueue", "unscheduleFromDispatchQueue", "close",
+                                        "Stop", "Release", "Release", "dealloc"}));
 }
