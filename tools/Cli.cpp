@@ -61,7 +61,8 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     std::vector<std::string> hostSets;
     auto* hostCommand = app.add_subcommand("host", "Run the plug-in in the host against a simulated or a real device");
     hostCommand->add_option("--device", host.device, "sim:FILE (a recording played as a device) or /dev/hidrawN")->required();
-    hostCommand->add_option("--plugin", host.plugin, "Plug-in module to load")->capture_default_str();
+    hostCommand->add_option("--plugin", host.plugin,
+                            "Plug-in module to load (default: $VELTOTOUCH_PLUGIN, else the installed or built module)");
     hostCommand->add_option("--speed", host.speed, "Simulated device: play S times faster than recorded")->capture_default_str();
     hostCommand->add_option("--set", hostSets, "Pipeline.KEY=VALUE: property to write before reports flow (VALUE is JSON)");
     hostCommand->add_option("--get", host.reads, "KEY: property to read at the end");

@@ -4,18 +4,28 @@
 #include "StateArguments.h"
 #include "ToolError.h"
 #include "ToolFiles.h"
-#include "pipeline/Util.h"
+#include "host/PluginLocator.h"
+#include "host/SimulatedDevicePlayer.h"
+#include "host/StopSignals.h"
 #include "platform/HidrawHostDevice.h"
+#include "platform/HidrawNode.h"
 #include "platform/HostEventSystem.h"
 #include "platform/MonotonicClock.h"
 #include "platform/PropertyDictionary.h"
 #include "platform/SimulatedHostDevice.h"
+#include "recording/JsonValue.h"
 #include "recording/PipelineRecording.h"
 
-#include <csignal>
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
 #include <cstring>
-#include <filesystem>
+#include <fstream>
+#include <memory>
 #include <mutex>
+#include <optional>
 
 namespace VeltoTool {
 
@@ -23,121 +33,149 @@ using VeltoHost::HostEventSystem;
 using VeltoHost::MonotonicClock;
 using VeltoHost::PropertyValue;
 using VeltoHost::SimulatedHostDevice;
+using VeltoHost::StopSignals;
 using VeltoTouch::PipelineRecording;
 
 namespace {
 
 constexpr const char* kFactoryName = "VeltoTouchHIDServiceFactory";
 constexpr const char* kSimulatedPrefix = "sim:";
+constexpr const char* kCountersKey = "Pipeline.Algs.EventStats";
+// A recording's state frames are the pipeline's own keys; the host reaches
+// them through the plug-in's "Pipeline" domain.
+constexpr const char* kPipelineDomain = "Pipeline.";
 // Waits are cut into slices this long so that a signal ends them promptly.
 constexpr std::uint64_t kWaitSliceMicroseconds = 20'000;
-// As-fast-as-possible playback still leaves the device's queue room.
-constexpr std::size_t kMaxQueuedReports = 512;
+// After a stop, the plug-in gets this long to take the reports it was given.
+constexpr auto kFinishTimeout = std::chrono::seconds(5);
+constexpr std::size_t kReadChunk = 1 << 20;
 
-volatile std::sig_atomic_t gStopRequested = 0;
+// Reads a whole file, giving up as soon as a stop is requested (a read
+// blocked on a pipe or a slow disk returns on the signal). Empty when stopped.
+std::optional<std::string> readUnlessStopped(const std::string& path)
+{
+    const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    if (fd < 0) {
+        if (errno == EINTR && StopSignals::requested()) return std::nullopt;
+        throw ToolError(path + ": " + std::strerror(errno));
+    }
+    std::string text;
+    std::string chunk(kReadChunk, '\0');
+    for (;;) {
+        if (StopSignals::requested()) break;
+        const ssize_t count = ::read(fd, chunk.data(), chunk.size());
+        if (count > 0) {
+            text.append(chunk.data(), static_cast<std::size_t>(count));
+        } else if (count == 0) {
+            ::close(fd);
+            return text;
+        } else if (errno != EINTR) {
+            const int error = errno;
+            ::close(fd);
+            throw ToolError(path + ": " + std::strerror(error));
+        }
+    }
+    ::close(fd);
+    return std::nullopt;
+}
 
-extern "C" void requestStop(int) { gStopRequested = 1; }
+void printSummary(const PropertyValue& stats, std::uint64_t discarded, std::ostream& out)
+{
+    out << "\nGesture counters (" << kCountersKey << "):\n";
+    if (stats.isDictionary()) {
+        for (const auto& [section, counters] : stats.asDictionary()) {
+            out << "  " << section << ":";
+            int shown = 0;
+            if (counters.isDictionary()) {
+                for (const auto& [name, value] : counters.asDictionary()) {
+                    if (value.toUInt64() == 0) continue;
+                    out << (shown++ % 4 == 0 ? "\n    " : "  ") << name << ' ' << value.toUInt64();
+                }
+            }
+            out << (shown ? "\n" : " none\n");
+        }
+    }
+    if (discarded) out << "  " << discarded << " reports were discarded unprocessed at the stop\n";
+}
 
-// SIGINT and SIGTERM end the run in order instead of killing the process.
-class StopSignals {
+// The output file is opened before the first report, so that a session is
+// never played only to find at the end that its recording cannot be saved.
+class OutputFile {
 public:
-    StopSignals()
+    explicit OutputFile(const std::string& path) : _path(path)
     {
-        gStopRequested = 0;
-        _previousInt = std::signal(SIGINT, requestStop);
-        _previousTerm = std::signal(SIGTERM, requestStop);
+        if (_path.empty()) return;
+        _stream.open(_path, std::ios::binary | std::ios::trunc);
+        if (!_stream) throw ToolError(_path + ": " + std::strerror(errno));
     }
-    ~StopSignals()
+    void write(const std::string& text)
     {
-        std::signal(SIGINT, _previousInt);
-        std::signal(SIGTERM, _previousTerm);
+        if (_path.empty()) return;
+        _stream << text;
+        _stream.close();
+        if (!_stream) throw ToolError(_path + ": write failed");
     }
-    static bool requested() { return gStopRequested != 0; }
 
 private:
-    void (*_previousInt)(int);
-    void (*_previousTerm)(int);
+    std::string _path;
+    std::ofstream _stream;
 };
 
-void sleepUnlessStopped(std::uint64_t microseconds)
+// Everything the host needs about its device before the plug-in starts.
+struct Device {
+    VeltoHost::HostDevice::Ref device;
+    std::shared_ptr<SimulatedHostDevice> simulated;
+    std::optional<PipelineRecording> recording;
+};
+
+std::optional<Device> openDevice(const std::string& name)
 {
-    while (microseconds > 0 && !StopSignals::requested()) {
-        const std::uint64_t slice = std::min(microseconds, kWaitSliceMicroseconds);
-        MonotonicClock::sleepMicroseconds(slice);
-        microseconds -= slice;
+    Device device;
+    if (name.rfind(kSimulatedPrefix, 0) == 0) {
+        const std::string path = name.substr(std::strlen(kSimulatedPrefix));
+        if (path.empty()) throw ToolError("--device sim: needs a recording after the colon (sim:FILE)");
+        std::optional<std::string> text = readUnlessStopped(path);
+        if (!text) return std::nullopt;
+        device.recording.emplace(std::string_view(*text));
+        device.simulated = SimulatedHostDevice::create();
+        device.device = device.simulated;
+        return device;
     }
+    const std::string whatElse = VeltoHost::HidrawNode::whatElse(name);
+    if (!whatElse.empty()) {
+        throw ToolError(name + " " + whatElse + "; expected a hidraw device node (/dev/hidrawN) or sim:FILE");
+    }
+    device.device = std::make_shared<VeltoHost::HidrawHostDevice>(name);
+    return device;
 }
 
-// Plays a recording as the device would have sent it: input reports pushed
-// with their recorded spacing divided by `speed` (0: as fast as the plug-in
-// takes them), state changes written as "Pipeline" properties at their place.
-void playRecordingAsDevice(const PipelineRecording& recording, SimulatedHostDevice& device, HostEventSystem& host,
-                           float speed)
+std::string pluginPath(const std::string& chosen)
 {
-    std::optional<std::uint64_t> previousReportNs;
-    for (const PipelineRecording::Frame& frame : recording.frames()) {
-        if (StopSignals::requested()) return;
-        if (frame.type == PipelineRecording::Frame::Type::State) {
-            host.setProperty("Pipeline." + frame.key, frame.value.hasValue() ? frame.value : PropertyValue::null());
-            continue;
-        }
-        if (speed > 0 && previousReportNs && frame.timestampNs > *previousReportNs) {
-            sleepUnlessStopped(static_cast<std::uint64_t>((frame.timestampNs - *previousReportNs) / 1000.0 / speed));
-        }
-        while (speed <= 0 && device.pendingReportCount() >= kMaxQueuedReports && !StopSignals::requested()) {
-            MonotonicClock::sleepMicroseconds(200);
-        }
-        previousReportNs = frame.timestampNs;
-        device.pushInputReport(frame.report);
-    }
-    device.waitUntilIdle();
-}
-
-void printSummary(const PropertyValue& stats, std::ostream& out)
-{
-    out << "\nGesture counters (Pipeline.Algs.EventStats):\n";
-    for (const auto& [section, counters] : stats.asDictionary()) {
-        out << "  " << section << ":";
-        int shown = 0;
-        for (const auto& [name, value] : counters.asDictionary()) {
-            if (value.toUInt64() == 0) continue;
-            out << (shown++ % 4 == 0 ? "\n    " : "  ") << name << ' ' << value.toUInt64();
-        }
-        out << (shown ? "\n" : " none\n");
-    }
+    if (!chosen.empty()) return chosen;
+    VeltoHost::PluginLocator::Result found = VeltoHost::PluginLocator::find();
+    if (found.path.empty()) throw ToolError(VeltoHost::PluginLocator::notFoundMessage(found));
+    return found.path;
 }
 
 }  // namespace
 
-std::string HostCommand::defaultPluginPath()
-{
-#ifdef VELTO_PLUGIN_FILE_NAME
-    std::error_code error;
-    const auto self = std::filesystem::read_symlink("/proc/self/exe", error);
-    if (!error) return (self.parent_path() / VELTO_PLUGIN_RELATIVE_DIR / VELTO_PLUGIN_FILE_NAME).lexically_normal();
-    return VELTO_PLUGIN_FILE_NAME;
-#else
-    return "libVeltoTouchHIDService.so";
-#endif
-}
-
 int HostCommand::run(const Options& options, std::ostream& out, std::ostream& err)
 {
-    std::optional<PipelineRecording> recording;
-    std::shared_ptr<SimulatedHostDevice> simulated;
-    VeltoHost::HostDevice::Ref device;
-    if (options.device.rfind(kSimulatedPrefix, 0) == 0) {
-        recording.emplace(std::string_view(ToolFiles::read(options.device.substr(std::strlen(kSimulatedPrefix)))));
-        simulated = SimulatedHostDevice::create();
-        device = simulated;
-    } else {
-        device = std::make_shared<VeltoHost::HidrawHostDevice>(options.device);
-    }
+    // Before any slow work: a stop from here on ends the run in order.
+    StopSignals signals;
 
+    const std::string plugin = pluginPath(options.plugin);
+    OutputFile savedRecording(options.saveRecording);
     std::vector<std::pair<std::string, PropertyValue>> settings;
     for (const auto& [key, text] : options.settings) settings.emplace_back(key, StateArguments::parseValue(key, text));
 
-    StopSignals signals;
+    std::optional<Device> device = openDevice(options.device);
+    if (!device) {
+        err << "veltotouch: stopped while loading " << options.device.substr(std::strlen(kSimulatedPrefix))
+            << std::endl;
+        return 0;
+    }
+
     HostEventSystem host;
     EventFormatter formatter(options.jsonLines, MonotonicClock::now());
     std::mutex outputLock;
@@ -145,28 +183,48 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
         std::lock_guard guard(outputLock);
         out << formatter.format(*event) << std::endl;
     });
-    host.start(options.plugin, kFactoryName, device);
+    host.start(plugin, kFactoryName, device->device);
 
     for (const auto& [key, value] : settings) {
         if (!host.setProperty(key, value)) err << "veltotouch: property " << key << " was not taken\n";
     }
 
-    if (simulated) {
-        playRecordingAsDevice(*recording, *simulated, host, options.speed);
+    std::uint64_t discarded = 0;
+    if (device->simulated) {
+        VeltoHost::SimulatedDevicePlayer player(
+            device->simulated,
+            [&](const std::string& key, const PropertyValue& value) { host.setProperty(kPipelineDomain + key, value); },
+            &StopSignals::requested, {options.speed, options.maxGapMicroseconds, 512},
+            [&](const std::string& note) { err << "veltotouch: note: " << note << std::endl; });
+        for (const PipelineRecording::Frame& frame : device->recording->frames()) {
+            if (!player.play(frame)) break;
+        }
+        // Whatever the device was given, the plug-in takes before the end is read.
+        if (!device->simulated->waitUntilIdle(kFinishTimeout)) discarded = device->simulated->pendingReportCount();
     } else {
-        err << "veltotouch: reading " << options.device << "; press Ctrl-C to stop\n";
-        while (!StopSignals::requested()) sleepUnlessStopped(kWaitSliceMicroseconds);
+        err << "veltotouch: reading " << options.device << "; press Ctrl-C to stop" << std::endl;
+        while (!StopSignals::requested()) MonotonicClock::sleepMicroseconds(kWaitSliceMicroseconds);
     }
-    host.drain();
+    // No report reaches the plug-in from here on, and every event it sent has
+    // been printed: what follows describes exactly what was processed.
+    host.unschedule();
+    if (discarded) err << "veltotouch: " << discarded << " reports were discarded unprocessed at the stop\n";
 
     {
         std::lock_guard guard(outputLock);
         for (const std::string& key : options.reads) out << formatter.formatState(key, host.copyProperty(key)) << '\n';
-        if (options.summary) printSummary(host.copyProperty("Pipeline.Algs.EventStats"), out);
+        if (options.summary) {
+            const PropertyValue counters = host.copyProperty(kCountersKey);
+            // JSON lines stay JSON: the counters come as one more state line.
+            if (options.jsonLines) {
+                out << formatter.formatState(kCountersKey, counters) << '\n';
+            } else {
+                printSummary(counters, discarded, out);
+            }
+        }
+        out.flush();
     }
-    if (!options.saveRecording.empty()) {
-        ToolFiles::write(options.saveRecording, host.copyProperty("Recording").asString());
-    }
+    if (!options.saveRecording.empty()) savedRecording.write(host.copyProperty("Recording").asString());
     host.stop();
     return 0;
 }

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <ostream>
 #include <string>
 #include <utility>
@@ -11,12 +12,17 @@ namespace VeltoTool {
 // runs it against a simulated device (a recording played as a device) or a
 // real hidraw device, prints every event the host's callback receives, and
 // shuts everything down in order at the end of the stream or on SIGINT/SIGTERM.
+//
+// At the end (or on a signal) it first stops the flow of reports and lets the
+// plug-in finish what it was given, then reads the --get properties and the
+// recording, so that what it prints and saves is exactly what was processed.
 class HostCommand {
 public:
     struct Options {
         std::string device;  // "sim:FILE" or a /dev/hidrawN path
-        std::string plugin = defaultPluginPath();
-        float speed = 1.0f;
+        std::string plugin;  // empty: look for it (PluginLocator)
+        double speed = 1.0;
+        std::uint64_t maxGapMicroseconds = 1'000'000;
         // Properties written before reports flow ("Pipeline.Algs.HoldTimeoutMilliseconds" and a JSON value).
         std::vector<std::pair<std::string, std::string>> settings;
         std::vector<std::string> reads;
@@ -25,10 +31,8 @@ public:
         bool summary = false;
     };
 
+    // Returns the exit status; throws ToolError for what the user can fix.
     static int run(const Options& options, std::ostream& out, std::ostream& err);
-
-    // The module built beside the tool, found relative to the running executable.
-    static std::string defaultPluginPath();
 };
 
 }  // namespace VeltoTool
