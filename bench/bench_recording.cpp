@@ -1,8 +1,10 @@
 // bench-libs: veltotouch_recording
 //
-// The recorder at the service's limit: writing the container (done for every
-// read of the recording property), reading it back, and copying the recorder
-// (what the service does while holding its pipeline lock).
+// The recorder at the service's limit: recording one frame (done for every
+// report and every pipeline property write, under the pipeline lock), writing
+// the container (done for every read of the recording property), reading it
+// back, and copying the recorder (what the service does while holding its
+// pipeline lock).
 #include "recording/PipelineRecording.h"
 
 #include <benchmark/benchmark.h>
@@ -46,6 +48,43 @@ PipelineRecording fullRecording()
     }
     return recording;
 }
+
+// Cost of one recorded frame through the recorder's own entry points (clock
+// reading included), with no wrapped pipeline, once the recording is full and
+// trimming has reached its steady rhythm. Every iteration records exactly one
+// frame; `stateEvery` is how many frames make one cycle of the pattern, the
+// first of which is a state write (0: reports only).
+void recordFrames(benchmark::State& state, std::uint64_t stateEvery)
+{
+    PipelineRecording recording;
+    recording.setMaxFrameCount(kServiceFrameLimit);
+    std::vector<std::uint8_t> report(73, 0);
+    report[0] = 0x01;
+    const std::string key = "Algs.HoldTimeoutMilliseconds";
+    const PropertyValue value = PropertyValue::uint64(300);
+    std::uint64_t count = 0;
+    auto recordOne = [&] {
+        if (stateEvery != 0 && count % stateEvery == 0) {
+            recording.setState(key, value);
+        } else {
+            report[1] = static_cast<std::uint8_t>(count);
+            recording.handleInputReport(report.data(), report.size());
+        }
+        ++count;
+    };
+    // Several trims' worth first, so that the timed part sees the steady state.
+    for (std::uint64_t i = 0; i < 8 * kServiceFrameLimit; ++i) recordOne();
+    for (auto _ : state) recordOne();
+    state.counters["frames"] = static_cast<double>(recording.frames().size());
+}
+
+void BM_RecordReportsOnly(benchmark::State& state) { recordFrames(state, 0); }
+BENCHMARK(BM_RecordReportsOnly);
+
+// A state write for every report, as when the host tunes the recogniser as
+// often as the device reports.
+void BM_RecordStateWritePerReport(benchmark::State& state) { recordFrames(state, 2); }
+BENCHMARK(BM_RecordStateWritePerReport);
 
 void BM_WriteContainer(benchmark::State& state)
 {
