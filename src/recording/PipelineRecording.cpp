@@ -150,7 +150,8 @@ PipelineRecording::PipelineRecording(const PipelineRecording& other)
       pipeline(other.pipeline),
       sleepMicroseconds(other.sleepMicroseconds),
       _frames(other._frames),
-      _maxFrameCount(other._maxFrameCount)
+      _maxFrameCount(other._maxFrameCount),
+      _framesKeptByLastTrim(other._framesKeptByLastTrim)
 {
     // _play stays not valid: the source's position belongs to the source's list.
 }
@@ -162,6 +163,7 @@ PipelineRecording& PipelineRecording::operator=(const PipelineRecording& other)
     sleepMicroseconds = other.sleepMicroseconds;
     _frames = other._frames;
     _maxFrameCount = other._maxFrameCount;
+    _framesKeptByLastTrim = other._framesKeptByLastTrim;
     _play = PlayCursor{};
     return *this;
 }
@@ -171,7 +173,8 @@ PipelineRecording::PipelineRecording(PipelineRecording&& other) noexcept
       pipeline(std::move(other.pipeline)),
       sleepMicroseconds(std::move(other.sleepMicroseconds)),
       _frames(std::move(other._frames)),
-      _maxFrameCount(other._maxFrameCount)
+      _maxFrameCount(other._maxFrameCount),
+      _framesKeptByLastTrim(other._framesKeptByLastTrim)
 {
     other._play = PlayCursor{};
 }
@@ -183,6 +186,7 @@ PipelineRecording& PipelineRecording::operator=(PipelineRecording&& other) noexc
     sleepMicroseconds = std::move(other.sleepMicroseconds);
     _frames = std::move(other._frames);
     _maxFrameCount = other._maxFrameCount;
+    _framesKeptByLastTrim = other._framesKeptByLastTrim;
     _play = PlayCursor{};
     other._play = PlayCursor{};
     return *this;
@@ -224,10 +228,26 @@ void PipelineRecording::handleInputReport(const std::uint8_t* data, std::size_t 
 void PipelineRecording::appendFrame(Frame frame)
 {
     _frames.push_back(std::move(frame));
-    // Trimming is deferred until the list holds twice the limit, so its pass
-    // over the list is paid about once per `limit` appends.
-    if (_maxFrameCount != 0 && _frames.size() / 2 >= _maxFrameCount) trimFrames(_frames, _maxFrameCount);
+    if (trimIsDue()) {
+        trimFrames(_frames, _maxFrameCount);
+        _framesKeptByLastTrim = _frames.size();
+    }
     _play.valid = false;
+}
+
+bool PipelineRecording::trimIsDue() const noexcept
+{
+    if (_maxFrameCount == 0) return false;
+    const std::uint64_t count = _frames.size();
+    // While trims leave at most one and a half times the limit, the list is
+    // trimmed at twice the limit: at least half a limit of appends pays for
+    // each pass. When state is written about as often as reports come, a
+    // trim leaves up to twice the limit; trimming at twice the limit would
+    // then run its pass on every append (on the real-time thread, under the
+    // pipeline lock), so the next trim waits until the list has doubled.
+    const std::uint64_t kept = _framesKeptByLastTrim;
+    const bool keptMuchMore = kept > _maxFrameCount && kept - _maxFrameCount > _maxFrameCount / 2;
+    return count / 2 >= (keptMuchMore ? kept : _maxFrameCount);
 }
 
 void PipelineRecording::trimFrames(FrameList& frames, std::uint64_t limit)
@@ -261,6 +281,7 @@ void PipelineRecording::trimToLimit()
 {
     const std::size_t before = _frames.size();
     trimFrames(_frames, _maxFrameCount);
+    _framesKeptByLastTrim = _frames.size();
     // The cursor may point at an erased frame; it must not be used again.
     if (_frames.size() != before) _play.valid = false;
 }

@@ -74,6 +74,10 @@ public:
     void setState(const std::string& key, PropertyValue value) override;
     void handleInputReport(const std::uint8_t* data, std::size_t length) override;
 
+    // Adds a frame at the end and trims when the list has grown enough since
+    // the last trim (see trimIsDue). Trimming later keeps the same frames as
+    // trimming earlier and again later, so the moment of a trim never changes
+    // what the recording holds once it is written.
     void appendFrame(Frame frame);
     // Keeps the newest `limit` input reports and, per key, the newest state
     // frame of each stretch between kept reports plus the newest one before
@@ -110,11 +114,14 @@ private:
         std::optional<std::uint64_t> lastInputReportTimeNs;
     };
 
+    bool trimIsDue() const noexcept;
     void trimToLimit();
     static void readFrames(const PropertyValue& container, FrameList& frames);
 
     FrameList _frames;
     std::uint64_t _maxFrameCount = 0;
+    // Size of the list right after the last trim (0 before the first).
+    std::uint64_t _framesKeptByLastTrim = 0;
     PlayCursor _play;
 };
 

@@ -5,7 +5,9 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <memory>
+#include <random>
 #include <sstream>
 #include <string>
 
@@ -97,6 +99,123 @@ TEST(RecordingTrim, AppendingTrimsWhenTheListReachesTwiceTheLimit)
     PipelineRecording unlimited;
     for (int i = 0; i < 3000; ++i) unlimited.handleInputReport(last.data(), last.size());
     EXPECT_EQ(unlimited.frames().size(), 3000u);
+}
+
+// How recording used to trim: after every append that brings the list to
+// twice the limit. The recorder may trim at other moments, but what it keeps
+// must never differ from this.
+struct TrimAtTwiceTheLimit {
+    explicit TrimAtTwiceTheLimit(std::uint64_t limit) : limit(limit) {}
+    void append(const Frame& frame)
+    {
+        frames.push_back(frame);
+        if (frames.size() / 2 >= limit) PipelineRecording::trimFrames(frames, limit);
+    }
+    // The container as json() writes it: trimmed first.
+    std::string json()
+    {
+        PipelineRecording::trimFrames(frames, limit);
+        return containerOf(frames);
+    }
+    std::string jsonOfCopy() const
+    {
+        PipelineRecording::FrameList copy = frames;
+        PipelineRecording::trimFrames(copy, limit);
+        return containerOf(copy);
+    }
+    static std::string containerOf(const PipelineRecording::FrameList& frames)
+    {
+        PipelineRecording unlimited;
+        for (const Frame& frame : frames) unlimited.appendFrame(frame);
+        return unlimited.json();
+    }
+
+    std::uint64_t limit;
+    PipelineRecording::FrameList frames;
+};
+
+TEST(RecordingTrim, KeepsWhatTrimmingAtTwiceTheLimitKeptForAnyPatternOfFrames)
+{
+    // Each row draws a frame pattern: `stateShare` in 1000 frames are state
+    // writes over `keys` keys, the rest reports. Now and then the container
+    // is written from a copy (the "Recording" property) or from the recorder
+    // itself (which trims it), and compared with the old rhythm's. Where
+    // state is rare, even the moments of trimming stay those of the old
+    // rhythm (`sameMoments`: the list has the same length after every frame).
+    struct Row {
+        std::uint64_t limit;
+        int frames;
+        int stateShare;
+        int keys;
+        unsigned seed;
+        bool sameMoments;
+    };
+    const Row rows[] = {
+        {1, 400, 500, 1, 1, false},     {1, 400, 900, 3, 2, false},    {2, 600, 500, 1, 3, false},
+        {3, 600, 0, 1, 4, true},        {3, 800, 700, 2, 5, false},    {5, 1500, 500, 1, 6, false},
+        {5, 1500, 950, 4, 7, false},    {8, 2000, 300, 2, 8, false},   {8, 2000, 1000, 3, 9, false},
+        {13, 3000, 500, 1, 10, false},  {13, 3000, 600, 6, 11, false}, {40, 4000, 500, 1, 12, false},
+        {40, 4000, 800, 20, 13, false}, {64, 5000, 50, 2, 14, true},   {100, 6000, 500, 2, 15, false},
+        {200, 3000, 0, 1, 16, true},
+    };
+    for (const Row& row : rows) {
+        SCOPED_TRACE("limit " + std::to_string(row.limit) + ", seed " + std::to_string(row.seed));
+        std::mt19937 random(row.seed);
+        std::uniform_int_distribution<int> share(0, 999);
+        std::uniform_int_distribution<int> key(0, row.keys - 1);
+        std::uniform_int_distribution<int> checkpoint(0, 99);
+
+        PipelineRecording recording;
+        recording.setMaxFrameCount(row.limit);
+        TrimAtTwiceTheLimit reference(row.limit);
+        for (int i = 0; i < row.frames; ++i) {
+            const auto stamp = static_cast<std::uint64_t>(i);
+            const Frame frame =
+                share(random) < row.stateShare
+                    ? stateFrame(stamp, "k" + std::to_string(key(random)), PropertyValue::uint64(stamp))
+                    : reportFrame(stamp, {static_cast<std::uint8_t>(i), static_cast<std::uint8_t>(i >> 8)});
+            recording.appendFrame(frame);
+            reference.append(frame);
+            if (row.sameMoments) {
+                ASSERT_EQ(recording.frames().size(), reference.frames.size()) << "frame " << i;
+            }
+            const int draw = checkpoint(random);
+            if (draw < 3) {
+                PipelineRecording copy(recording);
+                ASSERT_EQ(copy.json(), reference.jsonOfCopy()) << "copy after frame " << i;
+            } else if (draw < 4) {
+                ASSERT_EQ(recording.json(), reference.json()) << "after frame " << i;
+            }
+        }
+        EXPECT_EQ(recording.json(), reference.json());
+    }
+}
+
+TEST(RecordingTrim, WithAStateWritePerReportTrimmingIsPaidOncePerLimitAppends)
+{
+    // Every trim keeps the limit's reports plus about as many state frames,
+    // so a rhythm bound to twice the limit would trim after nearly every
+    // append. Trims show as appends after which the list is shorter.
+    constexpr std::uint64_t kLimit = 100;
+    constexpr std::uint64_t kAppends = 40 * kLimit;
+    PipelineRecording recording;
+    recording.setMaxFrameCount(kLimit);
+    const auto report = imageReport(1, 0);
+    std::uint64_t trims = 0;
+    std::size_t longest = 0;
+    for (std::uint64_t i = 0; i < kAppends; ++i) {
+        const std::size_t before = recording.frames().size();
+        if (i % 2 == 0) {
+            recording.setState("Algs.HoldTimeoutMilliseconds", PropertyValue::uint64(i));
+        } else {
+            recording.handleInputReport(report.data(), report.size());
+        }
+        if (recording.frames().size() <= before) ++trims;
+        longest = std::max(longest, recording.frames().size());
+    }
+    EXPECT_LE(trims, kAppends / kLimit);
+    EXPECT_LE(longest, 5 * kLimit) << "the list stays bounded";
+    EXPECT_GE(trims, kAppends / (5 * kLimit)) << "and is trimmed all the same";
 }
 
 TEST(RecordingTrim, SettingALimitTrimsAtOnceAndZeroRemovesIt)
