@@ -5,7 +5,8 @@
 #include <pthread.h>
 #include <sched.h>
 
-#include <system_error>
+#include <atomic>
+#include <exception>
 #include <thread>
 #include <utility>
 
@@ -16,10 +17,40 @@ namespace {
 // The kernel keeps 15 characters of a thread name plus the terminator.
 constexpr std::size_t kMaxThreadNameLength = 15;
 
+std::atomic<unsigned>& startsToFail()
+{
+    static std::atomic<unsigned> count{0};
+    return count;
+}
+
+// Takes one of the failures asked for by failNextStarts, if any is left.
+bool takeInjectedFailure() noexcept
+{
+    unsigned left = startsToFail().load();
+    while (left > 0 && !startsToFail().compare_exchange_weak(left, left - 1)) {
+    }
+    return left > 0;
+}
+
+void logStartFailure(const std::string& name, const char* reason) noexcept
+{
+    try {
+        static const Log log("Thread");
+        log.error("cannot start thread %s: %s", name, reason);
+    } catch (...) {
+        // Out of memory for the line itself: the caller still learns of the
+        // failure from the result.
+    }
+}
+
 }  // namespace
 
-void Thread::startDetached(std::function<void()> body, const std::string& name)
+bool Thread::startDetached(std::function<void()> body, const std::string& name) noexcept
 {
+    if (takeInjectedFailure()) {
+        logStartFailure(name, "failure injected by failNextStarts");
+        return false;
+    }
     try {
         std::thread thread([body = std::move(body), name = name.substr(0, kMaxThreadNameLength)]() mutable {
             if (!name.empty()) pthread_setname_np(pthread_self(), name.c_str());
@@ -29,12 +60,16 @@ void Thread::startDetached(std::function<void()> body, const std::string& name)
             body = nullptr;
         });
         thread.detach();
-    } catch (const std::system_error& error) {
-        // Out of threads: callers on the live path must not see an exception.
-        static const Log log("Thread");
-        log.error("cannot start thread %s: %s", name, error.what());
+        return true;
+    } catch (const std::exception& error) {
+        // Out of threads or memory: callers on the live path must not see an
+        // exception, and must not wait for a thread that never ran.
+        logStartFailure(name, error.what());
+        return false;
     }
 }
+
+void Thread::failNextStarts(unsigned count) noexcept { startsToFail().store(count); }
 
 int Thread::setCurrentScheduling(int policy, int priority)
 {

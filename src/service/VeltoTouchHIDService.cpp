@@ -152,11 +152,20 @@ void VeltoTouchHIDService::scheduleWithDispatchQueue(const SerialQueue::Ref& que
     // that it never reads members the host thread may change meanwhile.
     Semaphore::Ref signal = _inputReportThreadSignal;
     HostDevice::Ref device = _veltoDevice;
-    Thread::startDetached(
+    const bool started = Thread::startDetached(
         [this, info, device, signal]() mutable {
             runInputReportThread(std::move(info), std::move(device), std::move(signal));
         },
         "VeltoInputReport");
+    if (!started) {
+        // Nothing will ever signal: waiting would hang the host's thread. The
+        // service stays unscheduled (no event loop, no handshake), so a later
+        // unschedule, stop or release has nothing to wait for either.
+        _log.error("input report thread could not be started; no reports will be received");
+        _inputReportThreadSignal.reset();
+        _dispatchEventInfo.queue.reset();
+        return;
+    }
     signal->wait();
 }
 

@@ -1,3 +1,4 @@
+#include "platform/CaptureLogSink.h"
 #include "platform/Semaphore.h"
 #include "platform/Thread.h"
 
@@ -7,8 +8,10 @@
 #include <sched.h>
 
 #include <cerrno>
+#include <functional>
 #include <string>
 #include <thread>
+#include <vector>
 
 using namespace VeltoHost;
 using namespace std::chrono_literals;
@@ -33,7 +36,7 @@ TEST(ThreadTest, DetachedThreadRunsTheBodyUnderItsShortenedName)
     Semaphore done;
     std::string seenName;
     std::thread::id bodyThread;
-    Thread::startDetached(
+    const bool started = Thread::startDetached(
         [&] {
             char name[32] = {};
             pthread_getname_np(pthread_self(), name, sizeof name);
@@ -42,9 +45,32 @@ TEST(ThreadTest, DetachedThreadRunsTheBodyUnderItsShortenedName)
             done.signal();
         },
         "velto.input-report-thread");
+    EXPECT_TRUE(started);
     ASSERT_TRUE(done.waitFor(10s));
     EXPECT_EQ(seenName, "velto.input-rep");
     EXPECT_NE(bodyThread, std::this_thread::get_id());
+}
+
+TEST(ThreadTest, InjectedStartFailuresReportFalseAndLogWithoutRunningTheBody)
+{
+    CaptureLogSink::Scope capture(LogLevel::Error);
+    Semaphore ran;
+    const std::function<void()> body = [&ran] { ran.signal(); };
+
+    Thread::failNextStarts(2);
+    EXPECT_FALSE(Thread::startDetached(body, "first"));
+    EXPECT_FALSE(Thread::startDetached(body, "second"));
+    EXPECT_TRUE(Thread::startDetached(body, "third")) << "only the next two starts fail";
+    ASSERT_TRUE(ran.waitFor(10s));
+    EXPECT_FALSE(ran.waitFor(100ms)) << "the failed starts never ran their bodies";
+    EXPECT_EQ(capture.sink().messages("Thread"),
+              (std::vector<std::string>{"cannot start thread first: failure injected by failNextStarts",
+                                        "cannot start thread second: failure injected by failNextStarts"}));
+
+    Thread::failNextStarts(3);
+    Thread::failNextStarts(0);
+    EXPECT_TRUE(Thread::startDetached(body)) << "0 ends a failure run";
+    ASSERT_TRUE(ran.waitFor(10s));
 }
 
 TEST(ThreadTest, SchedulingReportsTheErrorNumber)

@@ -1,0 +1,134 @@
+// When the input-report thread cannot be started, scheduling must come back
+// with an error line instead of waiting for a thread that never runs, and
+// everything after it (unschedule, stop, the last release, a later
+// scheduling) must go on as for a service that was never scheduled.
+
+#include "platform/CaptureLogSink.h"
+#include "platform/HostEventSystem.h"
+#include "platform/Log.h"
+#include "platform/PropertyDictionary.h"
+#include "platform/Semaphore.h"
+#include "platform/SimulatedHostDevice.h"
+#include "platform/Thread.h"
+#include "service/ServiceHarness.h"
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <string>
+#include <thread>
+
+using namespace VeltoHost;
+using namespace VeltoTouch::Test;
+
+namespace {
+
+constexpr const char* kThreadNotStarted = "input report thread could not be started; no reports will be received";
+
+// Runs `call` on a thread of its own and says whether it came back. A call
+// that hangs is left waiting; whatever it uses must then be leaked by the
+// caller, not destroyed under it.
+bool returns(std::function<void()> call)
+{
+    auto done = Semaphore::create(0);
+    std::thread([call = std::move(call), done] {
+        call();
+        done->signal();
+    }).detach();
+    return done->waitFor(std::chrono::seconds(20));
+}
+
+// Ends the injected failures whatever way a test ends.
+struct InjectedStartFailures {
+    explicit InjectedStartFailures(unsigned count) { Thread::failNextStarts(count); }
+    ~InjectedStartFailures() { Thread::failNextStarts(0); }
+};
+
+std::vector<LogRecord> errorLines(const CaptureLogSink& sink)
+{
+    std::vector<LogRecord> errors;
+    for (const LogRecord& record : sink.records()) {
+        if (record.level == LogLevel::Error && record.message.rfind("pthread_setschedparam failed", 0) != 0) {
+            errors.push_back(record);
+        }
+    }
+    return errors;
+}
+
+}  // namespace
+
+TEST(ServiceThreadStart, SchedulingFailsSoftlyAndTheServiceCanBeScheduledLater)
+{
+    CaptureLogSink::Scope capture(LogLevel::Debug);
+    // Leaked on purpose should scheduling hang: the hung call still uses it.
+    auto* harness = new ServiceHarness;
+    ASSERT_EQ(harness->plugin().Start(harness->pluginRef(), PropertyValue::dictionary({}),
+                                      ServiceHarness::kServiceHandle),
+              kVeltoSuccess);
+    ASSERT_TRUE(harness->service().open(harness->serviceRef(), 0));
+    harness->setCallback(harness->collector);
+
+    {
+        InjectedStartFailures failures(1);
+        ASSERT_TRUE(returns([harness] { harness->schedule(); })) << "scheduling waits for a thread that never ran";
+    }
+    std::vector<LogRecord> errors = errorLines(capture.sink());
+    ASSERT_EQ(errors.size(), 2u);
+    EXPECT_EQ(errors[0].category, "Thread");
+    EXPECT_EQ(errors[0].message, "cannot start thread VeltoInputReport: failure injected by failNextStarts");
+    EXPECT_EQ(errors[1].category, "HIDService");
+    EXPECT_EQ(errors[1].message, kThreadNotStarted);
+
+    // Nobody receives reports: the device is neither scheduled nor called.
+    EXPECT_FALSE(harness->deviceIsScheduled());
+    EXPECT_FALSE(harness->deviceHasCallback());
+    harness->push(deviceResetReport());
+    EXPECT_EQ(harness->device()->pendingReportCount(), 1u);
+
+    ASSERT_TRUE(returns([harness] { harness->unschedule(); })) << "unscheduling waits for a thread that never ran";
+
+    // The next scheduling starts the thread, which takes the waiting report.
+    harness->schedule();
+    ASSERT_TRUE(harness->collector.waitFor(1));
+    harness->tearDown();
+    EXPECT_EQ(harness->collector.count(), 1u);
+    delete harness;
+}
+
+TEST(ServiceThreadStart, AFailedSchedulingLeavesNothingToWaitForAtStopAndRelease)
+{
+    CaptureLogSink::Scope capture(LogLevel::Error);
+    auto* harness = new ServiceHarness;
+    harness->plugin().Start(harness->pluginRef(), PropertyValue::dictionary({}), ServiceHarness::kServiceHandle);
+    InjectedStartFailures failures(1);
+    ASSERT_TRUE(returns([harness] { harness->schedule(); }));
+    // Straight to stop and the last release, without unscheduling: the
+    // release must not wait for the thread either.
+    ASSERT_TRUE(returns([harness] {
+        EXPECT_EQ(harness->plugin().Stop(harness->pluginRef()), kVeltoSuccess);
+        delete harness;
+    }));
+}
+
+TEST(ServiceThreadStart, TheHostsEventSystemStartsAndStopsAModuleWhoseThreadCannotStart)
+{
+    CaptureLogSink::Scope capture(LogLevel::Error);
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+    auto* host = new HostEventSystem;
+    {
+        InjectedStartFailures failures(1);
+        ASSERT_TRUE(returns([host, device] {
+            host->start(VELTO_SERVICE_MODULE_PATH, "VeltoTouchHIDServiceFactory", device);
+        })) << "the host's start hangs in scheduling";
+    }
+    EXPECT_TRUE(host->isRunning()) << "the plug-in was started; only its reports do not flow";
+    EXPECT_FALSE(device->isScheduled());
+    const std::vector<std::string> errors = capture.sink().messages("HIDService");
+    EXPECT_EQ(errors, std::vector<std::string>{kThreadNotStarted});
+    ASSERT_TRUE(returns([host] {
+        host->stop();
+        delete host;
+    })) << "the host's stop hangs";
+}
