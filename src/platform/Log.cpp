@@ -5,6 +5,8 @@
 #include <cstdlib>
 #include <cstring>
 #include <mutex>
+#include <string>
+#include <string_view>
 
 namespace VeltoHost {
 
@@ -34,8 +36,16 @@ class StderrSink : public LogSink {
 public:
     void write(const LogRecord& record) override
     {
-        std::fprintf(stderr, "[%s:%s] %s: %s\n", record.subsystem.c_str(), record.category.c_str(),
-                     levelName(record.level), record.message.c_str());
+        // A message may end in line breaks of its own (some documented texts
+        // do); they are folded into the one that ends the line, so that every
+        // message is one line to whatever reads the log line by line.
+        std::string_view message = record.message;
+        while (!message.empty() && message.back() == '\n') message.remove_suffix(1);
+        std::string line = "[" + record.subsystem + ":" + record.category + "] " + levelName(record.level) + ": ";
+        line.append(message);
+        line += '\n';
+        // One write per line keeps lines whole when others share the stream.
+        std::fwrite(line.data(), 1, line.size(), stderr);
     }
 };
 

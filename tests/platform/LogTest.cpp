@@ -4,7 +4,12 @@
 
 #include <gtest/gtest.h>
 
+#include <unistd.h>
+
 #include <cstdint>
+#include <cstdio>
+#include <string>
+#include <vector>
 
 using VeltoHost::CaptureLogSink;
 using VeltoHost::formatLog;
@@ -80,4 +85,73 @@ TEST(Log, ScopeRestoresThresholdAndSink)
         EXPECT_EQ(capture.sink().messages().size(), 1u);
     }
     EXPECT_EQ(Log::threshold(), before);
+}
+
+namespace {
+
+// Points standard error at a temporary file for the life of the object and
+// hands back what was written to it.
+class StandardErrorCapture {
+public:
+    StandardErrorCapture() : _file(std::tmpfile())
+    {
+        std::fflush(stderr);
+        _saved = dup(STDERR_FILENO);
+        dup2(fileno(_file), STDERR_FILENO);
+    }
+    ~StandardErrorCapture()
+    {
+        restore();
+        std::fclose(_file);
+    }
+    std::string text()
+    {
+        restore();
+        std::string text;
+        std::rewind(_file);
+        for (int c = std::fgetc(_file); c != EOF; c = std::fgetc(_file)) text += static_cast<char>(c);
+        return text;
+    }
+
+private:
+    void restore()
+    {
+        if (_saved < 0) return;
+        std::fflush(stderr);
+        dup2(_saved, STDERR_FILENO);
+        close(_saved);
+        _saved = -1;
+    }
+
+    std::FILE* _file;
+    int _saved = -1;
+};
+
+}  // namespace
+
+TEST(Log, TheStandardErrorSinkWritesOneLinePerMessage)
+{
+    // Messages whose text ends in line breaks of their own (the disjoint
+    // image line ends in two) still take exactly one line each; line breaks
+    // inside a message (the recogniser's dumps) are its own.
+    const int threshold = Log::threshold();
+    Log::setThreshold(LogLevel::Debug);
+    auto previous = Log::setSink(nullptr);
+    std::string written;
+    {
+        StandardErrorCapture capture;
+        Log log("HIDService", "org.example.hid.VeltoTouch");
+        log.error("Disjoint image (frame number: %ju -> %ju)\n\n", 7u, 9u);
+        log.log("Received image frame: %ju", 9u);
+        log.debug("%s", "\n");
+        log.debug("dump\nsecond row\n");
+        written = capture.text();
+    }
+    Log::setSink(previous);
+    Log::setThreshold(threshold);
+    EXPECT_EQ(written,
+              "[org.example.hid.VeltoTouch:HIDService] error: Disjoint image (frame number: 7 -> 9)\n"
+              "[org.example.hid.VeltoTouch:HIDService] default: Received image frame: 9\n"
+              "[org.example.hid.VeltoTouch:HIDService] debug: \n"
+              "[org.example.hid.VeltoTouch:HIDService] debug: dump\nsecond row\n");
 }
