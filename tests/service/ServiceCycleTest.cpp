@@ -305,3 +305,54 @@ TEST(ServiceCycle, ATapAndAResetArriveAsTheirEventsInOrderStampedWithTheirReport
     EXPECT_EQ(VeltoTouch::Util::nanosecondsFromMachTime(events[1].timeStamp), reportTimes[13]);
     EXPECT_EQ(VeltoTouch::Util::nanosecondsFromMachTime(events[2].timeStamp), reportTimes[14]);
 }
+
+TEST(ServiceCycle, AResetDuringAHoldGoesOutAsOneJobOfTwoEvents)
+{
+    // A finger held on K well past the hold timeout, then the device resets:
+    // the reset's frame ends the hold and the vendor event follows, both
+    // from one report, so one batch delivers both, in that order.
+    constexpr int kPadK = 'K' - 'A';
+    constexpr std::uint32_t kFrameIntervalMs = 10;
+    TraceRecorder traces;
+    ServiceHarness harness;
+    harness.bringUp();
+    std::uint32_t frame = 1;
+    auto push = [&](std::initializer_list<std::pair<int, std::int16_t>> readings) {
+        harness.push(imageReport(frame, 1000 + kFrameIntervalMs * (frame - 1), readings));
+        ++frame;
+    };
+    for (int i = 0; i < 3; ++i) push({});
+    for (int i = 0; i < 100; ++i) push({{kPadK, 300}});
+    ASSERT_TRUE(harness.collector.waitFor(2)) << "may-begin and hold start";
+    harness.queue()->drain();
+    const std::size_t batchesBefore = traces.points({kTraceDispatchBatch}).size();
+    const std::size_t eventsBefore = harness.collector.count();
+
+    harness.push(deviceResetReport());
+    ASSERT_TRUE(harness.collector.waitFor(eventsBefore + 2));
+    harness.queue()->drain();
+    harness.tearDown();
+
+    std::vector<DeliveredEvent> events = harness.collector.events();
+    ASSERT_EQ(events.size(), 4u);
+    EXPECT_EQ(events[0].phase, HidEvent::kPhaseMayBegin);
+    EXPECT_EQ(events[1].phase, HidEvent::kPhaseBegan) << "the hold started before the reset";
+    EXPECT_EQ(events[2].type, HidEvent::kTypeDigitizer);
+    EXPECT_EQ(events[2].phase, HidEvent::kPhaseEnded);
+    EXPECT_EQ(events[3].type, HidEvent::kTypeVendorDefined);
+    EXPECT_EQ(events[3].usagePage, 0xFF60u);
+    EXPECT_EQ(events[2].timeStamp, events[3].timeStamp) << "both belong to the reset report";
+
+    // The reset's delivery: one batch trace point with 2, then one per event.
+    std::vector<TracePoint> delivery = traces.points({kTraceDispatchBatch, kTraceDispatchEvent});
+    std::vector<TracePoint> batches = traces.points({kTraceDispatchBatch});
+    ASSERT_EQ(batches.size(), batchesBefore + 1);
+    EXPECT_EQ(args(batches.back()), (std::vector<std::uint64_t>{2, 0, 0, 0}));
+    ASSERT_GE(delivery.size(), 3u);
+    const std::vector<TracePoint> last(delivery.end() - 3, delivery.end());
+    EXPECT_EQ(last[0].code, kTraceDispatchBatch);
+    EXPECT_EQ(last[1].code, kTraceDispatchEvent);
+    EXPECT_EQ(args(last[1]), (std::vector<std::uint64_t>{HidEvent::kTypeDigitizer, HidEvent::kPhaseEnded, 0, 0}));
+    EXPECT_EQ(last[2].code, kTraceDispatchEvent);
+    EXPECT_EQ(args(last[2]), (std::vector<std::uint64_t>{HidEvent::kTypeVendorDefined, 0, 0, 0}));
+}

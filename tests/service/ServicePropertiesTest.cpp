@@ -12,8 +12,10 @@
 
 #include <atomic>
 #include <cstdio>
+#include <optional>
 #include <string>
 #include <thread>
+#include <vector>
 
 using namespace VeltoHost;
 using namespace VeltoTouch::Test;
@@ -250,5 +252,37 @@ TEST(ServiceProperties, PropertyCallsLogTheirKeysAndTheAggregateLooksUpEachKeyOn
                          "setOutputEvent:",
                          "copyEventWithType:matching:options:",
                      }));
+    harness.tearDown();
+}
+
+TEST(ServiceProperties, FactoryResetHoldDurationIsNullUnlessTheReportHasItsIDAndLength)
+{
+    // What the device answers for feature report 0x1F, and what the property
+    // makes of it.
+    struct Row {
+        const char* what;
+        std::vector<std::uint8_t> report;
+        std::optional<std::uint32_t> duration;
+    };
+    const Row rows[] = {
+        {"the layout's five bytes", {0x1F, 0x10, 0x27, 0x00, 0x00}, 10000},
+        {"longer than the layout", {0x1F, 0x01, 0x00, 0x00, 0x80, 0xEE, 0xEE}, 0x80000001},
+        {"one byte short", {0x1F, 0x10, 0x27, 0x00}, std::nullopt},
+        {"the ID alone", {0x1F}, std::nullopt},
+        {"another report ID", {0x20, 0x10, 0x27, 0x00, 0x00}, std::nullopt},
+        {"ID 0", {0x00, 0x10, 0x27, 0x00, 0x00}, std::nullopt},
+    };
+    ServiceHarness harness;
+    harness.bringUp();
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.what);
+        harness.setDebugReport(0x1F, row.report);
+        const PropertyValue value = harness.copyProperty("FactoryResetHoldDuration");
+        if (row.duration) {
+            EXPECT_EQ(value, PropertyValue::uint32(*row.duration));
+        } else {
+            EXPECT_FALSE(value.hasValue()) << value.description();
+        }
+    }
     harness.tearDown();
 }
