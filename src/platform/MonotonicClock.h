@@ -20,6 +20,14 @@ public:
     static Timebase timebase() noexcept;
     // Blocks the calling thread for at least `microseconds`.
     static void sleepMicroseconds(std::uint64_t microseconds) noexcept;
+
+    // Gives the clock another tick for the rest of the process: afterwards a
+    // tick lasts numer/denom nanoseconds, for now() and timebase() alike. With
+    // the nanosecond tick a mix-up of ticks and nanoseconds goes unnoticed, so
+    // test programs call this first thing, before anything has read the
+    // timebase (the time conversions read it once per process). A timebase
+    // with a zero term is refused (false) and changes nothing.
+    static bool setTimebase(Timebase timebase) noexcept;
 };
 
 }  // namespace VeltoHost
