@@ -107,15 +107,45 @@ void BM_ReadContainer(benchmark::State& state)
 }
 BENCHMARK(BM_ReadContainer)->Unit(benchmark::kMicrosecond);
 
-void BM_CopyRecorder(benchmark::State& state)
+void copyRecorder(benchmark::State& state, const PipelineRecording& recording)
 {
-    const PipelineRecording recording = fullRecording();
     for (auto _ : state) {
         PipelineRecording copy(recording);
         benchmark::DoNotOptimize(copy.frames().size());
     }
+    state.counters["frames"] = static_cast<double>(recording.frames().size());
 }
+
+void BM_CopyRecorder(benchmark::State& state) { copyRecorder(state, fullRecording()); }
 BENCHMARK(BM_CopyRecorder)->Unit(benchmark::kMicrosecond);
+
+// The longest list the state-write-per-report pattern leaves between two
+// trims: recorded until a trim, then until one frame short of the length
+// before it.
+void BM_CopyRecorderStateWritePerReport(benchmark::State& state)
+{
+    PipelineRecording recording;
+    recording.setMaxFrameCount(kServiceFrameLimit);
+    std::vector<std::uint8_t> report(73, 0);
+    report[0] = 0x01;
+    std::uint64_t count = 0;
+    auto recordOne = [&] {
+        if (count++ % 2 == 0) {
+            recording.setState("Algs.HoldTimeoutMilliseconds", PropertyValue::uint64(count));
+        } else {
+            recording.handleInputReport(report.data(), report.size());
+        }
+    };
+    for (std::uint64_t i = 0; i < 8 * kServiceFrameLimit; ++i) recordOne();
+    std::size_t longest = 0;
+    while (recording.frames().size() >= longest) {
+        longest = recording.frames().size();
+        recordOne();
+    }
+    while (recording.frames().size() + 1 < longest) recordOne();
+    copyRecorder(state, recording);
+}
+BENCHMARK(BM_CopyRecorderStateWritePerReport)->Unit(benchmark::kMicrosecond);
 
 }  // namespace
 

@@ -7,6 +7,7 @@
 
 #include <nlohmann/json.hpp>
 
+#include <algorithm>
 #include <limits>
 #include <stdexcept>
 #include <string_view>
@@ -240,14 +241,18 @@ bool PipelineRecording::trimIsDue() const noexcept
     if (_maxFrameCount == 0) return false;
     const std::uint64_t count = _frames.size();
     // While trims leave at most one and a half times the limit, the list is
-    // trimmed at twice the limit: at least half a limit of appends pays for
-    // each pass. When state is written about as often as reports come, a
-    // trim leaves up to twice the limit; trimming at twice the limit would
-    // then run its pass on every append (on the real-time thread, under the
-    // pipeline lock), so the next trim waits until the list has doubled.
+    // trimmed at twice the limit, as it always was: at least half a limit of
+    // appends pays for each pass. When state is written about as often as
+    // reports come, a trim leaves up to twice the limit, and trimming at twice
+    // the limit would run its pass on every append (on the real-time thread,
+    // under the pipeline lock). Then the next trim waits for the limit's
+    // worth of appends, or half of what was kept if that is more, so that a
+    // pass visits at most three frames per append. Waiting longer would
+    // lengthen the list, and with it the copy that reading the recording
+    // makes under the same lock.
     const std::uint64_t kept = _framesKeptByLastTrim;
-    const bool keptMuchMore = kept > _maxFrameCount && kept - _maxFrameCount > _maxFrameCount / 2;
-    return count / 2 >= (keptMuchMore ? kept : _maxFrameCount);
+    if (kept <= _maxFrameCount || kept - _maxFrameCount <= _maxFrameCount / 2) return count / 2 >= _maxFrameCount;
+    return count >= kept + std::max(_maxFrameCount, kept / 2);
 }
 
 void PipelineRecording::trimFrames(FrameList& frames, std::uint64_t limit)
