@@ -3,12 +3,12 @@
 #include "pipeline/Util.h"
 #include "platform/MonotonicClock.h"
 #include "platform/PropertyDictionary.h"
+#include "recording/ContainerWriter.h"
 #include "recording/JsonValue.h"
-
-#include <nlohmann/json.hpp>
 
 #include <algorithm>
 #include <limits>
+#include <sstream>
 #include <stdexcept>
 #include <string_view>
 #include <unordered_set>
@@ -21,7 +21,7 @@ using VeltoHost::PropertyDictionary;
 
 namespace {
 
-constexpr std::uint64_t kContainerVersion = 1;
+constexpr std::uint64_t kContainerVersion = ContainerWriter::kVersion;
 constexpr std::string_view kMigrationFailed = "migrateSerializedContainer failed: ";
 
 // Container keys and frame type names.
@@ -325,34 +325,11 @@ std::string PipelineRecording::json()
 {
     if (_maxFrameCount != 0) trimToLimit();
 
-    nlohmann::ordered_json frames = nlohmann::ordered_json::array();
-    for (const Frame& frame : _frames) {
-        nlohmann::ordered_json object = nlohmann::ordered_json::object();
-        switch (frame.type) {
-        case Frame::Type::State:
-            object[kTypeKey] = kStateType;
-            object[kTimestampKey] = frame.timestampNs;
-            object[kKeyKey] = frame.key;
-            // Values JSON cannot hold are written as JsonValue::toJson says:
-            // byte data as hex text, non-finite numbers as null; invalid UTF-8
-            // becomes U+FFFD. Writing never fails.
-            if (frame.value.hasValue()) object[kValueKey] = JsonValue::toJson(frame.value);
-            break;
-        case Frame::Type::InputReport:
-            object[kTypeKey] = kInputReportType;
-            object[kTimestampKey] = frame.timestampNs;
-            object[kReportKey] = Util::hexStringFromBytes(frame.report);
-            break;
-        default:
-            continue;
-        }
-        frames.push_back(std::move(object));
-    }
-
-    nlohmann::ordered_json container = nlohmann::ordered_json::object();
-    container[kVersionKey] = kContainerVersion;
-    container[kFramesKey] = std::move(frames);
-    return JsonValue::dump(container, true);
+    std::ostringstream text;
+    ContainerWriter writer(text);
+    for (const Frame& frame : _frames) writer.write(frame);
+    writer.finish();
+    return std::move(text).str();
 }
 
 void PipelineRecording::playReset()
