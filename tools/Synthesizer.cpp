@@ -29,6 +29,14 @@ std::uint32_t Synthesizer::frameCount(std::uint32_t durationMs) const
 
 PipelineRecording Synthesizer::synthesize(const std::vector<GestureScript::Step>& steps)
 {
+    PipelineRecording recording;
+    synthesize(steps, [&](const PipelineRecording::Frame& frame) { recording.appendFrame(frame); });
+    return recording;
+}
+
+void Synthesizer::synthesize(const std::vector<GestureScript::Step>& steps, const FrameSink& sink)
+{
+    _sink = &sink;
     idle(kLeadInMs, kSensorNoise);
     for (const GestureScript::Step& step : steps) {
         switch (step.action) {
@@ -44,7 +52,7 @@ PipelineRecording Synthesizer::synthesize(const std::vector<GestureScript::Step>
             break;
         }
     }
-    return std::move(_recording);
+    _sink = nullptr;
 }
 
 void Synthesizer::idle(std::uint32_t durationMs, double noise)
@@ -109,7 +117,7 @@ void Synthesizer::appendReport(std::vector<std::uint8_t> report)
     // A reset notice arrives between two frames; it takes the time of the last one.
     frame.timestampNs = kRecordingOriginNs + static_cast<std::uint64_t>(_timeMs - 1000) * 1'000'000u;
     frame.report = std::move(report);
-    _recording.appendFrame(std::move(frame));
+    (*_sink)(frame);
 }
 
 }  // namespace VeltoTool

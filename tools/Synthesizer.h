@@ -5,6 +5,7 @@
 #include "recording/PipelineRecording.h"
 
 #include <cstdint>
+#include <functional>
 #include <vector>
 
 namespace VeltoTool {
@@ -26,8 +27,14 @@ public:
     static constexpr double kSensorNoise = 5.0;
     static constexpr double kHeavyNoise = 25.0;
 
+    using FrameSink = std::function<void(const VeltoTouch::PipelineRecording::Frame&)>;
+
     Synthesizer(std::uint32_t framePeriodMs, std::uint32_t seed);
 
+    // Hands each frame to `sink` as soon as it is made, so that a script of
+    // any length is synthesised in constant memory.
+    void synthesize(const std::vector<GestureScript::Step>& steps, const FrameSink& sink);
+    // The whole recording at once, for short scripts.
     VeltoTouch::PipelineRecording synthesize(const std::vector<GestureScript::Step>& steps);
 
 private:
@@ -40,7 +47,7 @@ private:
 
     std::uint32_t _framePeriodMs;
     ContactModel _model;
-    VeltoTouch::PipelineRecording _recording;
+    const FrameSink* _sink = nullptr;
     std::uint32_t _frameNumber = 1;
     std::uint32_t _timeMs = 1000;
 };

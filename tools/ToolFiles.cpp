@@ -1,31 +1,105 @@
 #include "ToolFiles.h"
 
 #include "ToolError.h"
+#include "recording/JsonValue.h"
 
 #include <cerrno>
 #include <cstring>
-#include <fstream>
+#include <filesystem>
 #include <sstream>
+#include <stdexcept>
+#include <string_view>
 
 namespace VeltoTool {
 
+namespace {
+
+constexpr std::string_view kExpectedRecording = "expected a recording (JSON container)";
+constexpr std::string_view kInvalidContainer = "invalid container";
+
+[[noreturn]] void failWithErrno(const std::string& path, const char* fallback)
+{
+    throw ToolError(path + ": " + (errno != 0 ? std::strerror(errno) : fallback));
+}
+
+bool isDirectory(const std::string& path)
+{
+    std::error_code error;
+    return std::filesystem::is_directory(path, error);
+}
+
+bool onlyWhiteSpace(std::string_view text)
+{
+    return text.find_first_not_of(" \t\r\n") == std::string_view::npos;
+}
+
+// The line for a container that would not load. The container says
+// "invalid container" both for text that is not JSON and for JSON whose top
+// level is not an object; the user is told which, and of an empty file.
+std::string describeUnreadable(const std::string& path, const std::string& text, const std::string& message)
+{
+    const std::string expected(kExpectedRecording);
+    if (text.empty()) return path + ": empty file, " + expected;
+    if (onlyWhiteSpace(text)) return path + ": empty file (only blank space), " + expected;
+    if (!std::string_view(message).ends_with(kInvalidContainer)) return path + ": " + message;
+    using VeltoTouch::JsonValue;
+    if (!JsonValue::parse(text, JsonValue::TopLevel::AnyValue).hasValue()) return path + ": not JSON (" + message + ")";
+    return path + ": JSON, but not an object at the top level, " + expected + " (" + message + ")";
+}
+
+}  // namespace
+
 std::string ToolFiles::read(const std::string& path)
 {
+    if (isDirectory(path)) throw ToolError(path + ": is a directory");
+    errno = 0;
     std::ifstream in(path, std::ios::binary);
-    if (!in) throw ToolError(path + ": " + std::strerror(errno));
+    if (!in) failWithErrno(path, "cannot open");
     std::ostringstream text;
     text << in.rdbuf();
-    if (in.bad()) throw ToolError(path + ": read failed");
+    if (in.bad()) failWithErrno(path, "read failed");
     return text.str();
 }
 
 void ToolFiles::write(const std::string& path, const std::string& text)
 {
-    std::ofstream out(path, std::ios::binary | std::ios::trunc);
-    if (!out) throw ToolError(path + ": " + std::strerror(errno));
+    std::ofstream out = create(path);
     out << text;
+    close(out, path);
+}
+
+std::ofstream ToolFiles::create(const std::string& path)
+{
+    if (isDirectory(path)) throw ToolError(path + ": is a directory");
+    errno = 0;
+    std::ofstream out(path, std::ios::binary | std::ios::trunc);
+    if (!out) failWithErrno(path, "cannot create");
+    return out;
+}
+
+void ToolFiles::checkWritten(const std::ostream& out, const std::string& path)
+{
+    // errno still holds the failed write's reason (a full disk, say).
+    if (!out) failWithErrno(path, "write failed");
+}
+
+void ToolFiles::close(std::ofstream& out, const std::string& path)
+{
+    checkWritten(out, path);
+    errno = 0;
     out.close();
-    if (!out) throw ToolError(path + ": write failed");
+    if (!out) failWithErrno(path, "write failed");
+}
+
+VeltoTouch::PipelineRecording ToolFiles::readRecording(const std::string& path)
+{
+    if (isDirectory(path)) throw ToolError(path + ": is a directory, " + std::string(kExpectedRecording));
+    const std::string text = read(path);
+    try {
+        return VeltoTouch::PipelineRecording{std::string_view(text)};
+    } catch (const std::exception& error) {
+        throw ToolError(describeUnreadable(path, text, error.what()));
+    }
 }
 
 }  // namespace VeltoTool

@@ -1,15 +1,33 @@
 #pragma once
 
+#include "recording/PipelineRecording.h"
 
+#include <fstream>
 #include <string>
 
 namespace VeltoTool {
 
-// Whole-file reads and writes with errors that name the file.
+// File access for the tool's commands, with errors (ToolError) that name the
+// file and say what was wrong with it in words a user can act on.
 class ToolFiles {
 public:
+    // The whole file; a directory is refused rather than read as empty text.
     static std::string read(const std::string& path);
     static void write(const std::string& path, const std::string& text);
+
+    // Opens `path` for writing, emptying it, so that a bad output path fails
+    // before any work is done.
+    static std::ofstream create(const std::string& path);
+    // Throws, naming the file, once a write to `out` has failed.
+    static void checkWritten(const std::ostream& out, const std::string& path);
+    // Closes a file made by create(); throws when any write to it failed.
+    static void close(std::ofstream& out, const std::string& path);
+
+    // A recording read from a container file. Every failure is one line that
+    // starts with the path: a directory, an empty file and text that is not
+    // JSON are told apart from a container with faults, whose own message is
+    // kept.
+    static VeltoTouch::PipelineRecording readRecording(const std::string& path);
 };
 
 }  // namespace VeltoTool
