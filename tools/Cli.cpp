@@ -1,13 +1,17 @@
 #include "Cli.h"
 
 #include "DumpCommand.h"
+#include "FiniteNumberCheck.h"
 #include "HostCommand.h"
 #include "ReplayCommand.h"
 #include "StateArguments.h"
 #include "SynthCommand.h"
+#include "ToolError.h"
+#include "ToolVersion.h"
 
 #include <CLI/CLI.hpp>
 
+#include <algorithm>
 #include <exception>
 #include <iostream>
 
@@ -17,6 +21,55 @@ namespace {
 
 constexpr int kUsageError = 2;
 constexpr int kFailure = 1;
+
+// Slower than this, a 10 ms gap between reports would take hours.
+constexpr double kSlowestSpeed = 0.001;
+
+// Turns a ToolError of an argument parser into a check of the command line,
+// so that the argument is refused as a usage error before anything runs.
+template <typename Parse>
+CLI::Validator argumentCheck(const std::string& description, Parse parse)
+{
+    return CLI::Validator(
+        [parse](std::string& text) -> std::string {
+            try {
+                parse(text);
+            } catch (const ToolError& error) {
+                return error.what();
+            }
+            return {};
+        },
+        description);
+}
+
+const CLI::Validator& settingCheck()
+{
+    static const CLI::Validator check = argumentCheck("KEY=JSON", [](const std::string& argument) {
+        const auto [key, value] = StateArguments::split(argument);
+        StateArguments::parseValue(key, value);
+    });
+    return check;
+}
+
+const CLI::Validator& speedCheck()
+{
+    static const FiniteNumberCheck check(kSlowestSpeed, /*zeroAllowed=*/true);
+    return check;
+}
+
+// One line, whatever CLI11 wrote, and where to read more.
+std::string usageLine(const CLI::App& app, const CLI::ParseError& error, int argc, const char* const* argv)
+{
+    std::string message = error.what();
+    // CLI11 takes a word that is no command for a missing command.
+    if (app.get_subcommands().empty() && argc > 1 && argv[1][0] != '-') {
+        message = std::string("no command \"") + argv[1] + "\" (replay, synth, dump, host, help)";
+    }
+    std::replace(message.begin(), message.end(), '\n', ' ');
+    std::string help = "veltotouch help";
+    for (const CLI::App* command : app.get_subcommands()) help += " " + command->get_name();
+    return "veltotouch: " + message + " (see '" + help + "')";
+}
 
 std::vector<std::pair<std::string, std::string>> splitAll(const std::vector<std::string>& arguments)
 {
@@ -33,13 +86,23 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
 {
     CLI::App app{"veltotouch: replay, synthesise, inspect and host VeltoTouch recordings", "veltotouch"};
     app.require_subcommand(1);
+    app.set_version_flag("--version", ToolVersion::text());
 
     ReplayCommand::Options replay;
     std::vector<std::string> replaySets;
     auto* replayCommand = app.add_subcommand("replay", "Play a recording through a fresh pipeline and print its gestures");
     replayCommand->add_option("FILE", replay.file, "Recording container (JSON)")->required();
-    replayCommand->add_option("--speed", replay.speed, "Pace like the recording, S times faster (default: as fast as possible)");
-    replayCommand->add_option("--set", replaySets, "KEY=VALUE: pipeline state before the first frame (VALUE is JSON)");
+    replayCommand
+        ->add_option("--speed", replay.speed,
+                     "Pace like the recording, S times faster, S at least 0.001 (default 0: as fast as possible)")
+        ->check(speedCheck());
+    replayCommand
+        ->add_option("--max-gap", replay.maxGapSeconds,
+                     "When paced, wait at most this many seconds for one gap between reports")
+        ->check(FiniteNumberCheck(0))
+        ->capture_default_str();
+    replayCommand->add_option("--set", replaySets, "KEY=VALUE: pipeline state before the first frame (VALUE is JSON)")
+        ->check(settingCheck());
     replayCommand->add_option("--get", replay.reads, "KEY: pipeline state to print after the last frame");
     replayCommand->add_flag("--dump", replay.dump, "Print the recogniser's per-frame descriptions");
     replayCommand->add_flag("--jsonl", replay.jsonLines, "One JSON object per line");
@@ -48,13 +111,16 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     auto* synthCommand = app.add_subcommand("synth", "Write a recording made from a gesture script");
     synthCommand->add_option("SCRIPT", synth.script, "Gesture script, or @FILE to read it from a file")->required();
     synthCommand->add_option("-o,--output", synth.output, "Recording to write")->required();
-    synthCommand->add_option("--frame-period", synth.framePeriodMs, "Milliseconds between frames")->capture_default_str();
+    synthCommand->add_option("--frame-period", synth.framePeriodMs, "Milliseconds between frames, at least 1")
+        ->check(FiniteNumberCheck(1))
+        ->capture_default_str();
     synthCommand->add_option("--seed", synth.seed, "Seed of the sensor noise")->capture_default_str();
 
     DumpCommand::Options dump;
     auto* dumpCommand = app.add_subcommand("dump", "Draw each Image report of a recording over the pad layout");
     dumpCommand->add_option("FILE", dump.file, "Recording container (JSON)")->required();
-    dumpCommand->add_option("--frames", dump.frames, "A:B, inclusive range of frame numbers (either side may be left out)");
+    dumpCommand->add_option("--frames", dump.frames, "A:B, inclusive range of frame numbers (either side may be left out)")
+        ->check(argumentCheck("A:B", [](const std::string& text) { DumpCommand::parseRange(text); }));
     dumpCommand->add_flag("--levels", dump.levels, "Draw the levels instead of the readings");
 
     HostCommand::Options host;
@@ -63,12 +129,16 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     hostCommand->add_option("--device", host.device, "sim:FILE (a recording played as a device) or /dev/hidrawN")->required();
     hostCommand->add_option("--plugin", host.plugin,
                             "Plug-in module to load (default: $VELTOTOUCH_PLUGIN, else the installed or built module)");
-    hostCommand->add_option("--speed", host.speed, "Simulated device: play S times faster than recorded")->capture_default_str();
-    hostCommand->add_option("--set", hostSets, "Pipeline.KEY=VALUE: property to write before reports flow (VALUE is JSON)");
+    hostCommand->add_option("--speed", host.speed, "Simulated device: play S times faster than recorded")->capture_default_str()->check(speedCheck());
+    hostCommand->add_option("--set", hostSets, "Pipeline.KEY=VALUE: property to write before reports flow (VALUE is JSON)")->check(settingCheck());
     hostCommand->add_option("--get", host.reads, "KEY: property to read at the end");
     hostCommand->add_option("--save-recording", host.saveRecording, "Write the plug-in's \"Recording\" property here at the end");
     hostCommand->add_flag("--jsonl", host.jsonLines, "One JSON object per line");
     hostCommand->add_flag("--summary", host.summary, "Print the gesture counters at the end");
+
+    std::string helpTopic;
+    auto* helpCommand = app.add_subcommand("help", "Describe the commands, or one COMMAND and its options");
+    helpCommand->add_option("COMMAND", helpTopic, "Command to describe");
 
     try {
         app.parse(argc, argv);
@@ -78,17 +148,35 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     } catch (const CLI::CallForAllHelp&) {
         out << app.help("", CLI::AppFormatMode::All);
         return 0;
+    } catch (const CLI::CallForVersion& version) {
+        out << version.what() << '\n';
+        return 0;
     } catch (const CLI::ParseError& error) {
-        // Help of the subcommand that was being parsed, when there is one.
-        err << "veltotouch: " << error.what() << '\n';
-        err << "Run 'veltotouch --help' or 'veltotouch <command> --help' for usage.\n";
+        err << usageLine(app, error, argc, argv) << '\n';
         return kUsageError;
+    }
+
+    if (*helpCommand) {
+        if (helpTopic.empty()) {
+            // The whole tool's help: App::help() would describe the help command itself.
+            out << app.get_formatter()->make_help(&app, app.get_name(), CLI::AppFormatMode::Normal);
+            return 0;
+        }
+        const auto commands = app.get_subcommands([&](const CLI::App* command) {
+            return command->get_name() == helpTopic && command != helpCommand;
+        });
+        if (commands.empty()) {
+            err << "veltotouch: help: no command \"" << helpTopic << "\" (replay, synth, dump, host)\n";
+            return kUsageError;
+        }
+        out << commands.front()->help("veltotouch");
+        return 0;
     }
 
     try {
         if (*replayCommand) {
             replay.settings = splitAll(replaySets);
-            ReplayCommand::run(replay, out);
+            ReplayCommand::run(replay, out, err);
         } else if (*synthCommand) {
             SynthCommand::run(synth);
         } else if (*dumpCommand) {

@@ -44,8 +44,7 @@ DumpCommand::FrameRange DumpCommand::parseRange(const std::string& text)
 void DumpCommand::run(const Options& options, std::ostream& out)
 {
     const FrameRange range = parseRange(options.frames);
-    const std::string text = ToolFiles::read(options.file);
-    VeltoTouch::PipelineRecording recording{std::string_view(text)};
+    const VeltoTouch::PipelineRecording recording = ToolFiles::readRecording(options.file);
     for (const auto& frame : recording.frames()) {
         if (frame.type != VeltoTouch::PipelineRecording::Frame::Type::InputReport) continue;
         auto image = VeltoTouch::InputReport::Image::parse(frame.report.data(), frame.report.size());

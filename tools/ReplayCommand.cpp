@@ -5,6 +5,7 @@
 #include "StateArguments.h"
 #include "ToolFiles.h"
 #include "pipeline/Pipeline.h"
+#include "platform/MonotonicClock.h"
 #include "recording/PipelineRecording.h"
 
 #include <memory>
@@ -15,15 +16,29 @@ namespace VeltoTool {
 using VeltoTouch::Pipeline;
 using VeltoTouch::PipelineRecording;
 
-void ReplayCommand::run(const Options& options, std::ostream& out)
+namespace {
+
+// Each setting is read back at once, so that one the pipeline converted
+// (a string stored as 0) is reported before it skews the whole replay.
+void applySettings(Pipeline& pipeline, const ReplayCommand::Options& options, std::ostream& err)
 {
-    const std::string text = ToolFiles::read(options.file);
-    PipelineRecording recording{std::string_view(text)};
+    for (const auto& [key, valueText] : options.settings) {
+        const VeltoHost::PropertyValue value = StateArguments::parseValue(key, valueText);
+        pipeline.setState(key, value);
+        if (auto warning = StateArguments::readBackWarning(key, value, pipeline.getState(key))) {
+            err << "veltotouch: warning: " << *warning << '\n';
+        }
+    }
+}
+
+}  // namespace
+
+void ReplayCommand::run(const Options& options, std::ostream& out, std::ostream& err)
+{
+    PipelineRecording recording = ToolFiles::readRecording(options.file);
 
     auto pipeline = std::make_shared<Pipeline>();
-    for (const auto& [key, valueText] : options.settings) {
-        pipeline->setState(key, StateArguments::parseValue(key, valueText));
-    }
+    applySettings(*pipeline, options, err);
 
     // The first time the playback sets is its start; readable lines count from there.
     EventFormatter formatter(options.jsonLines);
@@ -39,10 +54,23 @@ void ReplayCommand::run(const Options& options, std::ostream& out)
     };
 
     std::optional<AlgsDumpSink::Scope> dumps;
-    if (options.dump) dumps.emplace(out);
+    if (options.dump) {
+        dumps.emplace(out, options.jsonLines ? AlgsDumpSink::Format::JsonLines : AlgsDumpSink::Format::Text);
+    }
 
     recording.pipeline = pipeline;
-    if (options.speed <= 0) recording.sleepMicroseconds = [](std::uint64_t) {};
+    GapCap gapCap(options.maxGapSeconds, [&](const std::string& note) { err << "veltotouch: note: " << note << '\n'; });
+    if (options.speed > 0) {
+        // Whatever was printed is let out before each wait: into a pipe the
+        // output is block-buffered, and a paced run stopped with Ctrl-C would
+        // otherwise end with nothing shown.
+        recording.sleepMicroseconds = [&](std::uint64_t microseconds) {
+            out.flush();
+            VeltoHost::MonotonicClock::sleepMicroseconds(gapCap(microseconds));
+        };
+    } else {
+        recording.sleepMicroseconds = [](std::uint64_t) {};
+    }
     const float speed = options.speed > 0 ? options.speed : 1.0f;
     recording.playReset();
     while (recording.playCanContinue()) recording.playNextFrame(speed);

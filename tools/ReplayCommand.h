@@ -1,5 +1,7 @@
 #pragma once
 
+#include "GapCap.h"
+
 #include <ostream>
 #include <string>
 #include <utility>
@@ -15,18 +17,21 @@ public:
         std::string file;
         // 0 plays as fast as possible; otherwise paced like the recording, this many times faster.
         float speed = 0;
+        // Paced playback waits at most this long for one gap between reports.
+        double maxGapSeconds = GapCap::kDefaultMaxSeconds;
         // Pipeline state applied before the first frame: key relative to the
         // pipeline ("Algs.HoldTimeoutMilliseconds") and a JSON value.
         std::vector<std::pair<std::string, std::string>> settings;
         // Pipeline state read after the last frame.
         std::vector<std::string> reads;
         bool dump = false;
+        // Every line of `out` is then one JSON object, dumps included.
         bool jsonLines = false;
     };
 
-    // Writes events (and dumps) to `out`. Throws ToolError or the recording's
-    // own errors.
-    static void run(const Options& options, std::ostream& out);
+    // Writes events, dumps and reads to `out`; warnings and notes to `err`.
+    // Throws ToolError or the recording's own errors.
+    static void run(const Options& options, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

@@ -2,20 +2,34 @@
 
 #include "platform/PropertyValue.h"
 
+#include <optional>
 #include <string>
 #include <utility>
 
 namespace VeltoTool {
 
-// Parsing of the tool's KEY=VALUE state arguments, where VALUE is JSON.
+// Parsing of the tool's KEY=VALUE state arguments, where VALUE is JSON, and
+// the check of what a setting became.
 class StateArguments {
 public:
     // "Algs.HoldTimeoutMilliseconds=600" -> key and the text after '='.
+    // Throws ToolError without '=' or without a key.
     static std::pair<std::string, std::string> split(const std::string& argument);
     // The JSON value of a setting; throws ToolError naming the key when the
     // text is not JSON. A bare word that is not JSON is taken as a string, so
     // that --set Key=text works without shell-quoted quotes.
     static VeltoHost::PropertyValue parseValue(const std::string& key, const std::string& text);
+
+    // The pipeline converts a setting instead of refusing it: a string
+    // written as the threshold is stored as 0, 1e40 as infinity, 2^32 + 500
+    // as a timeout of 500. Given what was written and what the key reads
+    // back, this is the text of a warning when the two differ in kind or in
+    // value (at the precision the key keeps), and nothing when the setting
+    // took as written. A number 0 or 1 written to a flag is the flag as
+    // written. The text names the key and both values; the caller adds its
+    // "warning:" prefix.
+    static std::optional<std::string> readBackWarning(const std::string& key, const VeltoHost::PropertyValue& written,
+                                                      const VeltoHost::PropertyValue& readBack);
 };
 
 }  // namespace VeltoTool

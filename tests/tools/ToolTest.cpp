@@ -91,20 +91,6 @@ TEST(Tool, JsonLinesCarryTheEventFieldsAndStateReads)
     EXPECT_EQ(lines.back()["value"]["ResetCount"], 1);
 }
 
-TEST(Tool, SettingsApplyBeforeTheFirstFrame)
-{
-    // With a hold timeout longer than every touch, the holds example holds nothing.
-    ToolRun run = runTool({"replay", std::string(VELTO_EXAMPLES_DIR) + "/holds.json", "--set",
-                       "Algs.HoldTimeoutMilliseconds=5000", "--get", "Algs.HoldTimeoutMilliseconds"});
-    ASSERT_EQ(run.status, 0) << run.err;
-    EXPECT_EQ(run.out.find("hold-start"), std::string::npos);
-    EXPECT_NE(run.out.find("Algs.HoldTimeoutMilliseconds = 5000"), std::string::npos);
-
-    ToolRun bad = runTool({"replay", std::string(VELTO_EXAMPLES_DIR) + "/holds.json", "--set", "NoEquals"});
-    EXPECT_EQ(bad.status, 1);
-    EXPECT_NE(bad.err.find("expected KEY=VALUE"), std::string::npos);
-}
-
 TEST(Tool, SynthesisedGesturesAreRecognisedAsMeant)
 {
     using V = std::vector<std::string>;
@@ -138,58 +124,6 @@ TEST(Tool, ScriptErrorsNameTheLineAndTheProblem)
     EXPECT_EQ(message("# comment only\n\n tap top ; idle 1.5s # trailing"), "no error");
     EXPECT_EQ(GestureScript::parse("idle 1.5s; idle 20ms")[0].durationMs, 1500u);
 }
-
-TEST(Tool, MalformedFilesAndUsageErrorsExitNonZeroWithOneLine)
-{
-    TempDir dir;
-    struct Case {
-        std::string content;
-        std::string message;
-    };
-    const Case cases[] = {
-        {"not json", "veltotouch: migrateSerializedContainer failed: invalid container\n"},
-        {R"({"Version": 2})", "veltotouch: migrateSerializedContainer failed: invalid container version: 2\n"},
-        {R"({"Version": 1})", "veltotouch: invalid frames\n"},
-        {R"({"Version": 1, "Frames": [{"Type": "InputReport", "Timestamp": 1, "Report": "100"}]})",
-         "veltotouch: invalid hex string\n"},
-    };
-    for (const Case& c : cases) {
-        fs::path file = dir.file("bad.json", c.content);
-        for (const char* command : {"replay", "dump"}) {
-            ToolRun run = runTool({command, file.string()});
-            EXPECT_EQ(run.status, 1) << c.content;
-            EXPECT_EQ(run.err, c.message) << command;
-        }
-    }
-    ToolRun missing = runTool({"replay", (dir.file("absent.json")).string()});
-    EXPECT_EQ(missing.status, 1);
-    EXPECT_NE(missing.err.find("No such file"), std::string::npos);
-
-    EXPECT_EQ(runTool({}).status, 2);
-    EXPECT_EQ(runTool({"replay"}).status, 2);
-    EXPECT_EQ(runTool({"frobnicate"}).status, 2);
-    EXPECT_EQ(runTool({"synth", "tap top"}).status, 2);  // -o is required
-    ToolRun help = runTool({"replay", "--help"});
-    EXPECT_EQ(help.status, 0);
-    EXPECT_NE(help.out.find("--jsonl"), std::string::npos);
-}
-
-TEST(Tool, DumpDrawsTheChosenFrames)
-{
-    const std::string file = std::string(VELTO_EXAMPLES_DIR) + "/taps.json";
-    ToolRun run = runTool({"dump", file, "--frames", "25:26"});
-    ASSERT_EQ(run.status, 0) << run.err;
-    EXPECT_EQ(run.out.rfind("# Image frame 25    time 1240 ms\n\n", 0), 0u);
-    EXPECT_NE(run.out.find("# Image frame 26    time 1250 ms"), std::string::npos);
-    EXPECT_EQ(run.out.find("# Image frame 27"), std::string::npos);
-    // 2 headers, 2 blank lines after them, 13 rows each, a blank line after each drawing.
-    EXPECT_EQ(std::count(run.out.begin(), run.out.end(), '\n'), 2 * (2 + 13 + 1));
-
-    EXPECT_EQ(runTool({"dump", file, "--frames", "9:3"}).status, 1);
-    EXPECT_EQ(runTool({"dump", file, "--frames", "x"}).err,
-              "veltotouch: invalid frame range \"x\" (expected A:B with frame numbers)\n");
-}
-
 
 TEST(Tool, HostWithTheSimulatedDeviceGivesTheSameGesturesAsReplay)
 {
