@@ -131,6 +131,11 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
                             "Plug-in module to load (default: $VELTOTOUCH_PLUGIN, else the installed or built module)");
     hostCommand->add_option("--speed", host.speed, "Simulated device: play S times faster than recorded")->capture_default_str()->check(speedCheck());
     hostCommand->add_option("--set", hostSets, "Pipeline.KEY=VALUE: property to write before reports flow (VALUE is JSON)")->check(settingCheck());
+    hostCommand
+        ->add_option("--max-gap", host.maxGapSeconds,
+                     "Simulated device: wait at most this many seconds for one gap between reports")
+        ->check(FiniteNumberCheck(0))
+        ->capture_default_str();
     hostCommand->add_option("--get", host.reads, "KEY: property to read at the end");
     hostCommand->add_option("--save-recording", host.saveRecording, "Write the plug-in's \"Recording\" property here at the end");
     hostCommand->add_flag("--jsonl", host.jsonLines, "One JSON object per line");

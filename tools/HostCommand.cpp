@@ -13,11 +13,7 @@
 #include "platform/MonotonicClock.h"
 #include "platform/PropertyDictionary.h"
 #include "platform/SimulatedHostDevice.h"
-#include "recording/JsonValue.h"
 #include "recording/PipelineRecording.h"
-
-#include <fcntl.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <chrono>
@@ -48,37 +44,8 @@ constexpr const char* kPipelineDomain = "Pipeline.";
 constexpr std::uint64_t kWaitSliceMicroseconds = 20'000;
 // After a stop, the plug-in gets this long to take the reports it was given.
 constexpr auto kFinishTimeout = std::chrono::seconds(5);
-constexpr std::size_t kReadChunk = 1 << 20;
-
-// Reads a whole file, giving up as soon as a stop is requested (a read
-// blocked on a pipe or a slow disk returns on the signal). Empty when stopped.
-std::optional<std::string> readUnlessStopped(const std::string& path)
-{
-    const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
-    if (fd < 0) {
-        if (errno == EINTR && StopSignals::requested()) return std::nullopt;
-        throw ToolError(path + ": " + std::strerror(errno));
-    }
-    std::string text;
-    std::string chunk(kReadChunk, '\0');
-    for (;;) {
-        if (StopSignals::requested()) break;
-        const ssize_t count = ::read(fd, chunk.data(), chunk.size());
-        if (count > 0) {
-            text.append(chunk.data(), static_cast<std::size_t>(count));
-        } else if (count == 0) {
-            ::close(fd);
-            return text;
-        } else if (errno != EINTR) {
-            const int error = errno;
-            ::close(fd);
-            throw ToolError(path + ": " + std::strerror(error));
-        }
-    }
-    ::close(fd);
-    return std::nullopt;
-}
-
+// As-fast-as-possible playback still leaves the device's queue room.
+constexpr std::size_t kMaxQueuedReports = 512;
 void printSummary(const PropertyValue& stats, std::uint64_t discarded, std::ostream& out)
 {
     out << "\nGesture counters (" << kCountersKey << "):\n";
@@ -98,29 +65,6 @@ void printSummary(const PropertyValue& stats, std::uint64_t discarded, std::ostr
     if (discarded) out << "  " << discarded << " reports were discarded unprocessed at the stop\n";
 }
 
-// The output file is opened before the first report, so that a session is
-// never played only to find at the end that its recording cannot be saved.
-class OutputFile {
-public:
-    explicit OutputFile(const std::string& path) : _path(path)
-    {
-        if (_path.empty()) return;
-        _stream.open(_path, std::ios::binary | std::ios::trunc);
-        if (!_stream) throw ToolError(_path + ": " + std::strerror(errno));
-    }
-    void write(const std::string& text)
-    {
-        if (_path.empty()) return;
-        _stream << text;
-        _stream.close();
-        if (!_stream) throw ToolError(_path + ": write failed");
-    }
-
-private:
-    std::string _path;
-    std::ofstream _stream;
-};
-
 // Everything the host needs about its device before the plug-in starts.
 struct Device {
     VeltoHost::HostDevice::Ref device;
@@ -134,9 +78,8 @@ std::optional<Device> openDevice(const std::string& name)
     if (name.rfind(kSimulatedPrefix, 0) == 0) {
         const std::string path = name.substr(std::strlen(kSimulatedPrefix));
         if (path.empty()) throw ToolError("--device sim: needs a recording after the colon (sim:FILE)");
-        std::optional<std::string> text = readUnlessStopped(path);
-        if (!text) return std::nullopt;
-        device.recording.emplace(std::string_view(*text));
+        device.recording = ToolFiles::readRecordingUnlessStopped(path, &StopSignals::requested);
+        if (!device.recording) return std::nullopt;
         device.simulated = SimulatedHostDevice::create();
         device.device = device.simulated;
         return device;
@@ -165,7 +108,10 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
     StopSignals signals;
 
     const std::string plugin = pluginPath(options.plugin);
-    OutputFile savedRecording(options.saveRecording);
+    // Opened before the first report: a session is never played only to find
+    // at the end that its recording cannot be saved.
+    std::ofstream savedRecording;
+    if (!options.saveRecording.empty()) savedRecording = ToolFiles::create(options.saveRecording);
     std::vector<std::pair<std::string, PropertyValue>> settings;
     for (const auto& [key, text] : options.settings) settings.emplace_back(key, StateArguments::parseValue(key, text));
 
@@ -186,7 +132,11 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
     host.start(plugin, kFactoryName, device->device);
 
     for (const auto& [key, value] : settings) {
-        if (!host.setProperty(key, value)) err << "veltotouch: property " << key << " was not taken\n";
+        if (!host.setProperty(key, value)) {
+            err << "veltotouch: property " << key << " was not taken\n";
+        } else if (auto warning = StateArguments::readBackWarning(key, value, host.copyProperty(key))) {
+            err << "veltotouch: warning: " << *warning << '\n';
+        }
     }
 
     std::uint64_t discarded = 0;
@@ -194,8 +144,9 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
         VeltoHost::SimulatedDevicePlayer player(
             device->simulated,
             [&](const std::string& key, const PropertyValue& value) { host.setProperty(kPipelineDomain + key, value); },
-            &StopSignals::requested, {options.speed, options.maxGapMicroseconds, 512},
-            [&](const std::string& note) { err << "veltotouch: note: " << note << std::endl; });
+            &StopSignals::requested, {options.speed, kMaxQueuedReports},
+            VeltoHost::GapCap(options.maxGapSeconds,
+                              [&](const std::string& note) { err << "veltotouch: note: " << note << std::endl; }));
         for (const PipelineRecording::Frame& frame : device->recording->frames()) {
             if (!player.play(frame)) break;
         }
@@ -224,7 +175,10 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
         }
         out.flush();
     }
-    if (!options.saveRecording.empty()) savedRecording.write(host.copyProperty("Recording").asString());
+    if (!options.saveRecording.empty()) {
+        savedRecording << host.copyProperty("Recording").asString();
+        ToolFiles::close(savedRecording, options.saveRecording);
+    }
     host.stop();
     return 0;
 }

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "host/GapCap.h"
+
 #include <cstdint>
 #include <ostream>
 #include <string>
@@ -22,7 +24,7 @@ public:
         std::string device;  // "sim:FILE" or a /dev/hidrawN path
         std::string plugin;  // empty: look for it (PluginLocator)
         double speed = 1.0;
-        std::uint64_t maxGapMicroseconds = 1'000'000;
+        double maxGapSeconds = VeltoHost::GapCap::kDefaultMaxSeconds;
         // Properties written before reports flow ("Pipeline.Algs.HoldTimeoutMilliseconds" and a JSON value).
         std::vector<std::pair<std::string, std::string>> settings;
         std::vector<std::string> reads;

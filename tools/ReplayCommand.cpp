@@ -59,7 +59,7 @@ void ReplayCommand::run(const Options& options, std::ostream& out, std::ostream&
     }
 
     recording.pipeline = pipeline;
-    GapCap gapCap(options.maxGapSeconds, [&](const std::string& note) { err << "veltotouch: note: " << note << '\n'; });
+    VeltoHost::GapCap gapCap(options.maxGapSeconds, [&](const std::string& note) { err << "veltotouch: note: " << note << '\n'; });
     if (options.speed > 0) {
         // Whatever was printed is let out before each wait: into a pipe the
         // output is block-buffered, and a paced run stopped with Ctrl-C would

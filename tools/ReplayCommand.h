@@ -1,6 +1,6 @@
 #pragma once
 
-#include "GapCap.h"
+#include "host/GapCap.h"
 
 #include <ostream>
 #include <string>
@@ -18,7 +18,7 @@ public:
         // 0 plays as fast as possible; otherwise paced like the recording, this many times faster.
         float speed = 0;
         // Paced playback waits at most this long for one gap between reports.
-        double maxGapSeconds = GapCap::kDefaultMaxSeconds;
+        double maxGapSeconds = VeltoHost::GapCap::kDefaultMaxSeconds;
         // Pipeline state applied before the first frame: key relative to the
         // pipeline ("Algs.HoldTimeoutMilliseconds") and a JSON value.
         std::vector<std::pair<std::string, std::string>> settings;

@@ -3,6 +3,9 @@
 #include "ToolError.h"
 #include "recording/JsonValue.h"
 
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
@@ -16,6 +19,7 @@ namespace {
 
 constexpr std::string_view kExpectedRecording = "expected a recording (JSON container)";
 constexpr std::string_view kInvalidContainer = "invalid container";
+constexpr std::size_t kReadChunk = 1 << 20;
 
 [[noreturn]] void failWithErrno(const std::string& path, const char* fallback)
 {
@@ -94,7 +98,42 @@ void ToolFiles::close(std::ofstream& out, const std::string& path)
 VeltoTouch::PipelineRecording ToolFiles::readRecording(const std::string& path)
 {
     if (isDirectory(path)) throw ToolError(path + ": is a directory, " + std::string(kExpectedRecording));
-    const std::string text = read(path);
+    return recordingFromText(path, read(path));
+}
+
+std::optional<VeltoTouch::PipelineRecording> ToolFiles::readRecordingUnlessStopped(
+    const std::string& path, const std::function<bool()>& stopRequested)
+{
+    if (isDirectory(path)) throw ToolError(path + ": is a directory, " + std::string(kExpectedRecording));
+    const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    if (fd < 0) {
+        if (errno == EINTR && stopRequested()) return std::nullopt;
+        failWithErrno(path, "cannot open");
+    }
+    std::string text;
+    std::string chunk(kReadChunk, '\0');
+    for (;;) {
+        if (stopRequested()) {
+            ::close(fd);
+            return std::nullopt;
+        }
+        const ssize_t count = ::read(fd, chunk.data(), chunk.size());
+        if (count == 0) break;
+        if (count > 0) {
+            text.append(chunk.data(), static_cast<std::size_t>(count));
+        } else if (errno != EINTR) {
+            const int error = errno;
+            ::close(fd);
+            errno = error;
+            failWithErrno(path, "read failed");
+        }
+    }
+    ::close(fd);
+    return recordingFromText(path, text);
+}
+
+VeltoTouch::PipelineRecording ToolFiles::recordingFromText(const std::string& path, const std::string& text)
+{
     try {
         return VeltoTouch::PipelineRecording{std::string_view(text)};
     } catch (const std::exception& error) {

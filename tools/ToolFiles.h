@@ -3,6 +3,8 @@
 #include "recording/PipelineRecording.h"
 
 #include <fstream>
+#include <functional>
+#include <optional>
 #include <string>
 
 namespace VeltoTool {
@@ -28,6 +30,14 @@ public:
     // JSON are told apart from a container with faults, whose own message is
     // kept.
     static VeltoTouch::PipelineRecording readRecording(const std::string& path);
+    // The same, read in pieces so that a stop request ends it at once, also
+    // when a read is blocked (a pipe, a stalled disk: the stop's signal
+    // interrupts it). Empty when stopped.
+    static std::optional<VeltoTouch::PipelineRecording> readRecordingUnlessStopped(
+        const std::string& path, const std::function<bool()>& stopRequested);
+
+private:
+    static VeltoTouch::PipelineRecording recordingFromText(const std::string& path, const std::string& text);
 };
 
 }  // namespace VeltoTool

@@ -4,7 +4,6 @@
 
 #include <algorithm>
 #include <chrono>
-#include <cmath>
 #include <utility>
 
 namespace VeltoHost {
@@ -15,6 +14,8 @@ namespace {
 constexpr std::uint64_t kWaitSliceNs = 20'000'000;
 // How long pushing pauses when the device's queue is full at speed 0.
 constexpr std::uint64_t kQueueFullPauseMicroseconds = 200;
+// No step of the schedule is longer than a year: the deadline stays far from overflow.
+constexpr std::uint64_t kLongestScheduleStepNs = 365ull * 24 * 3600 * 1'000'000'000ull;
 
 std::uint64_t monotonicNanoseconds()
 {
@@ -26,12 +27,12 @@ std::uint64_t monotonicNanoseconds()
 }  // namespace
 
 SimulatedDevicePlayer::SimulatedDevicePlayer(SimulatedHostDevice::Ref device, StateWriter writeState,
-                                             StopCheck shouldStop, Options options, Notice notice)
+                                             StopCheck shouldStop, Options options, GapCap gapCap)
     : _device(std::move(device)),
       _writeState(std::move(writeState)),
       _shouldStop(std::move(shouldStop)),
       _options(options),
-      _notice(std::move(notice))
+      _gapCap(std::move(gapCap))
 {
 }
 
@@ -75,19 +76,12 @@ void SimulatedDevicePlayer::pace(std::uint64_t timestampNs)
     if (!_previousReportNs) {
         _deadlineNs = now;
     } else if (timestampNs > *_previousReportNs) {
-        const double waitNs = static_cast<double>(timestampNs - *_previousReportNs) / _options.speed;
-        const double capNs = static_cast<double>(_options.maxGapMicroseconds) * 1000.0;
-        if (waitNs > capNs && !_gapNoticed) {
-            _gapNoticed = true;
-            if (_notice) {
-                _notice("a gap of " + std::to_string((timestampNs - *_previousReportNs) / 1'000'000) +
-                        " ms between reports is played as " + std::to_string(_options.maxGapMicroseconds / 1000) +
-                        " ms (--max-gap)");
-            }
-        }
+        // Computed in floating point: a gap of 2^64 ns at a speed below 1 must saturate, not wrap.
+        const double waitMicroseconds = static_cast<double>(timestampNs - *_previousReportNs) / _options.speed / 1000.0;
+        const std::uint64_t wait = _gapCap(GapCap::wholeMicroseconds(waitMicroseconds));
+        const std::uint64_t waitNs = std::min<std::uint64_t>(wait, kLongestScheduleStepNs / 1000) * 1000;
         // A schedule that fell behind (a slow consumer) is not made up in a burst.
-        _deadlineNs = std::max(_deadlineNs, now - std::min(now, kWaitSliceNs)) +
-                      static_cast<std::uint64_t>(std::min(waitNs, capNs));
+        _deadlineNs = std::max(_deadlineNs, now - std::min(now, kWaitSliceNs)) + waitNs;
     }
     _previousReportNs = timestampNs;
     sleepUntil(_deadlineNs);

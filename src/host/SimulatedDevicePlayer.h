@@ -1,5 +1,6 @@
 #pragma once
 
+#include "host/GapCap.h"
 #include "platform/PropertyValue.h"
 #include "platform/SimulatedHostDevice.h"
 #include "recording/PipelineRecording.h"
@@ -23,26 +24,23 @@ namespace VeltoHost {
 // its own recording holds the state frames where they were.
 //
 // Pacing follows a schedule rather than sleeping gap by gap, so that the time
-// spent pushing does not add up over a long recording. One gap is never
-// waited for longer than `maxGapMicroseconds` (a recording with a time jump
-// of years must not hang the host); the first capped gap is reported through
-// `notice`. Every wait ends early when `shouldStop` turns true.
+// spent pushing does not add up over a long recording. The wait for one gap
+// goes through a GapCap (a recording with a time jump of years must not hang
+// the host). Every wait ends early when `shouldStop` turns true.
 class SimulatedDevicePlayer {
 public:
     using StateWriter = std::function<void(const std::string& key, const PropertyValue& value)>;
     using StopCheck = std::function<bool()>;
-    using Notice = std::function<void(const std::string& text)>;
 
     struct Options {
         // Recorded spacing divided by this; 0 pushes as fast as the plug-in takes reports.
         double speed = 1.0;
-        std::uint64_t maxGapMicroseconds = 1'000'000;
         // At speed 0, pushing pauses while this many reports wait in the device.
         std::size_t maxQueuedReports = 512;
     };
 
     SimulatedDevicePlayer(SimulatedHostDevice::Ref device, StateWriter writeState, StopCheck shouldStop,
-                          Options options, Notice notice = {});
+                          Options options, GapCap gapCap = GapCap());
 
     // Plays one frame; false when a stop was requested before it was played.
     bool play(const VeltoTouch::PipelineRecording::Frame& frame);
@@ -61,11 +59,10 @@ private:
     StateWriter _writeState;
     StopCheck _shouldStop;
     Options _options;
-    Notice _notice;
+    GapCap _gapCap;
 
     std::optional<std::uint64_t> _previousReportNs;
     std::uint64_t _deadlineNs = 0;  // monotonic time at which the next report is due
-    bool _gapNoticed = false;
     std::uint64_t _reportsPushed = 0;
     std::uint64_t _statesWritten = 0;
 };

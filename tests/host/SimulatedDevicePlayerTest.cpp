@@ -99,7 +99,7 @@ TEST(SimulatedDevicePlayerTest, StateWritesLandBetweenTheReportsAroundThemAtEver
         SlowConsumer consumer(device);
         SimulatedDevicePlayer player(
             device, [&](const std::string& key, const PropertyValue&) { consumer.note("S:" + key); },
-            [] { return false; }, {speed, 1'000'000, 512});
+            [] { return false; }, {speed, 512});
 
         std::vector<std::string> expected;
         for (std::uint8_t id = 1; id <= 60; ++id) {
@@ -124,8 +124,8 @@ TEST(SimulatedDevicePlayerTest, AStopRequestEndsEveryWait)
     std::vector<std::string> notices;
     SimulatedDevicePlayer player(
         device, [](const std::string&, const PropertyValue&) { ADD_FAILURE() << "state written"; },
-        [&] { return stop.load(); }, {1.0, 3'600'000'000ull, 512},
-        [&](const std::string& text) { notices.push_back(text); });
+        [&] { return stop.load(); }, {1.0, 512},
+        GapCap(3600.0, [&](const std::string& text) { notices.push_back(text); }));
 
     ASSERT_TRUE(player.play(report(1, 0)));
     std::thread stopper([&] {

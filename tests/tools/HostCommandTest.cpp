@@ -217,3 +217,13 @@ TEST(HostCommandTest, ACopiedToolFindsItsModuleOrSaysWhereItLooked)
               "veltotouch: plug-in module not found; looked in /nonexistent/module.so (VELTOTOUCH_PLUGIN) (give "
               "--plugin PATH or set VELTOTOUCH_PLUGIN)\n");
 }
+
+TEST(HostCommandTest, ASettingThePlugInConvertsIsWarnedOfAndStillWritten)
+{
+    ToolRun run = runTool({"host", "--device", "sim:" + kExamples + "/taps.json", "--speed", "0", "--set",
+                           "Pipeline.Algs.ActivationThreshold=abc", "--get", "Pipeline.Algs.ActivationThreshold"});
+    ASSERT_EQ(run.status, 0) << run.err;
+    EXPECT_EQ(run.err.rfind("veltotouch: warning: ", 0), 0u) << run.err;
+    EXPECT_NE(run.err.find("Pipeline.Algs.ActivationThreshold"), std::string::npos) << run.err;
+    EXPECT_NE(run.out.find("Pipeline.Algs.ActivationThreshold = 0"), std::string::npos) << run.out;
+}

@@ -4,7 +4,7 @@
 #include <functional>
 #include <string>
 
-namespace VeltoTool {
+namespace VeltoHost {
 
 // Caps the wait for one gap between input reports when a recording is played
 // at its own pace. A recording may hold a clock jump (a time stamp of 10^18 ns
@@ -30,6 +30,10 @@ public:
 
     std::uint64_t maxMicroseconds() const noexcept { return _maxMicroseconds; }
 
+    // A wait computed in floating point, as a whole number of microseconds:
+    // truncated, 0 for what is not positive, saturated at the largest count.
+    static std::uint64_t wholeMicroseconds(double microseconds) noexcept;
+
 private:
     std::uint64_t _maxMicroseconds;
     double _maxSeconds;
@@ -37,4 +41,4 @@ private:
     bool _noted = false;
 };
 
-}  // namespace VeltoTool
+}  // namespace VeltoHost

@@ -1,4 +1,4 @@
-#include "GapCap.h"
+#include "host/GapCap.h"
 
 #include <gtest/gtest.h>
 
@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-using VeltoTool::GapCap;
+using VeltoHost::GapCap;
 
 namespace {
 

@@ -1,23 +1,15 @@
-#include "GapCap.h"
+#include "host/GapCap.h"
 
 #include <cstdio>
 #include <limits>
 #include <utility>
 
-namespace VeltoTool {
+namespace VeltoHost {
 
 namespace {
 
 // The largest double below 2^64, so that the conversion cannot overflow.
 constexpr double kLongestMicroseconds = 18446744073709549568.0;
-
-std::uint64_t microsecondsFromSeconds(double seconds)
-{
-    const double microseconds = seconds * 1e6;
-    if (!(microseconds > 0)) return 0;
-    if (microseconds >= kLongestMicroseconds) return std::numeric_limits<std::uint64_t>::max();
-    return static_cast<std::uint64_t>(microseconds);
-}
 
 std::string secondsText(double seconds)
 {
@@ -28,8 +20,15 @@ std::string secondsText(double seconds)
 
 }  // namespace
 
+std::uint64_t GapCap::wholeMicroseconds(double microseconds) noexcept
+{
+    if (!(microseconds > 0)) return 0;
+    if (microseconds >= kLongestMicroseconds) return std::numeric_limits<std::uint64_t>::max();
+    return static_cast<std::uint64_t>(microseconds);
+}
+
 GapCap::GapCap(double maxSeconds, Note note)
-    : _maxMicroseconds(microsecondsFromSeconds(maxSeconds)), _maxSeconds(maxSeconds), _note(std::move(note))
+    : _maxMicroseconds(wholeMicroseconds(maxSeconds * 1e6)), _maxSeconds(maxSeconds), _note(std::move(note))
 {
 }
 
@@ -45,4 +44,4 @@ std::uint64_t GapCap::operator()(std::uint64_t microseconds)
     return _maxMicroseconds;
 }
 
-}  // namespace VeltoTool
+}  // namespace VeltoHost
