@@ -4,10 +4,12 @@
 
 #include <toml++/toml.h>
 
+#include <fcntl.h>
+#include <unistd.h>
+
 #include <array>
 #include <cerrno>
 #include <cstring>
-#include <fstream>
 #include <sstream>
 #include <utility>
 
@@ -160,12 +162,26 @@ private:
 
 DaemonConfig DaemonConfig::load(const std::string& path)
 {
-    std::ifstream file(path, std::ios::binary);
-    if (!file) throw Error(path + ": cannot read: " + std::strerror(errno));
-    std::ostringstream text;
-    text << file.rdbuf();
-    if (file.bad()) throw Error(path + ": cannot read: " + std::strerror(errno));
-    return parse(text.str(), path);
+    // Read with the system calls themselves: a stream opens a directory
+    // without complaint and then reads it as an empty file, which would start
+    // the daemon on defaults instead of saying that the path is wrong.
+    const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
+    if (fd < 0) throw Error(path + ": cannot read: " + std::strerror(errno));
+    std::string text;
+    char buffer[4096];
+    for (;;) {
+        const ssize_t count = ::read(fd, buffer, sizeof buffer);
+        if (count == 0) break;
+        if (count < 0 && errno == EINTR) continue;
+        if (count < 0) {
+            const int error = errno;
+            ::close(fd);
+            throw Error(path + ": cannot read: " + std::strerror(error));
+        }
+        text.append(buffer, static_cast<std::size_t>(count));
+    }
+    ::close(fd);
+    return parse(text, path);
 }
 
 DaemonConfig DaemonConfig::parse(std::string_view text, const std::string& sourceName)

@@ -136,14 +136,22 @@ TEST_F(DaemonConfigTest, BadFilesNameTheFileThePlaceAndTheFault)
     }
 }
 
-TEST_F(DaemonConfigTest, AFileThatCannotBeReadIsNamed)
+TEST_F(DaemonConfigTest, AFileThatCannotBeReadIsNamedNotTakenForAnEmptyOne)
 {
-    const std::string path = (_dir / "absent.toml").string();
-    try {
-        DaemonConfig::load(path);
-        ADD_FAILURE() << "loaded a file that does not exist";
-    } catch (const DaemonConfig::Error& error) {
-        EXPECT_EQ(std::string(error.what()), path + ": cannot read: No such file or directory");
+    const std::string absent = (_dir / "absent.toml").string();
+    const std::string directory = (_dir / "conf.d").string();
+    fs::create_directories(directory);
+    const std::vector<std::pair<std::string, std::string>> cases = {
+        {absent, absent + ": cannot read: No such file or directory"},
+        {directory, directory + ": cannot read: Is a directory"},
+    };
+    for (const auto& [path, message] : cases) {
+        try {
+            DaemonConfig::load(path);
+            ADD_FAILURE() << "loaded " << path;
+        } catch (const DaemonConfig::Error& error) {
+            EXPECT_EQ(std::string(error.what()), message);
+        }
     }
 }
 
