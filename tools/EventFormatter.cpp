@@ -1,6 +1,7 @@
 #include "EventFormatter.h"
 
 #include "algs/Algs.h"
+#include "host/Gesture.h"
 #include "pipeline/Util.h"
 #include "recording/JsonValue.h"
 
@@ -14,8 +15,6 @@ using VeltoHost::HidEvent;
 
 namespace {
 
-constexpr std::uint32_t kTapEventMask = 0x00020000;
-
 std::int64_t frameNumberOf(const HidEvent& event)
 {
     return event.integerValue(VeltoTouch::Algs::kFrameNumberField).value_or(0);
@@ -23,31 +22,11 @@ std::int64_t frameNumberOf(const HidEvent& event)
 
 }  // namespace
 
-std::string EventFormatter::gestureName(const HidEvent& event)
-{
-    if (event.kind() == HidEvent::Kind::VendorDefined) return "device-reset";
-    switch (event.phase()) {
-    case HidEvent::kPhaseMayBegin: return "may-begin";
-    case HidEvent::kPhaseBegan: return "hold-start";
-    case HidEvent::kPhaseChanged: return "hold-change";
-    case HidEvent::kPhaseEnded: return "hold-end";
-    case HidEvent::kPhaseCancelled: return "cancel";
-    case 0: return (event.digitizer().eventMask & kTapEventMask) ? "tap" : "unknown";
-    default: return "unknown";
-    }
-}
-
-std::string EventFormatter::regionName(double y)
-{
-    if (y == 1.0) return "middle";
-    if (y == 2.0) return "bottom";
-    if (y == 3.0) return "top";
-    return "none";
-}
-
 std::string EventFormatter::format(const HidEvent& event) const
 {
-    const std::string gesture = gestureName(event);
+    const VeltoHost::Gesture meaning = VeltoHost::Gesture::of(event);
+    const std::string gesture(VeltoHost::Gesture::name(meaning.kind));
+    const std::string region(VeltoHost::Gesture::name(meaning.region));
     if (_jsonLines) {
         nlohmann::ordered_json line;
         line["gesture"] = gesture;
@@ -56,7 +35,7 @@ std::string EventFormatter::format(const HidEvent& event) const
             line["usage"] = event.vendorDefined().usage;
         } else {
             const auto& digitizer = event.digitizer();
-            line["region"] = regionName(digitizer.y);
+            line["region"] = region;
             line["frame"] = frameNumberOf(event);
             line["phase"] = event.phase();
             line["eventMask"] = digitizer.eventMask;
@@ -73,7 +52,7 @@ std::string EventFormatter::format(const HidEvent& event) const
                       gesture.c_str(), event.vendorDefined().usagePage, event.vendorDefined().usage);
     } else {
         std::snprintf(text, sizeof text, "%9.3fs  %-12s %-7s frame %lld", elapsedNs / 1e9, gesture.c_str(),
-                      regionName(event.digitizer().y).c_str(), static_cast<long long>(frameNumberOf(event)));
+                      region.c_str(), static_cast<long long>(frameNumberOf(event)));
     }
     return text;
 }

@@ -27,12 +27,6 @@ public:
     // A state or property read: {"key":"Algs.EventStats","value":{...}} or "KEY = VALUE".
     std::string formatState(const std::string& key, const VeltoHost::PropertyValue& value) const;
 
-    // "may-begin", "tap", "hold-start", "hold-change", "hold-end", "cancel",
-    // "device-reset", or "unknown".
-    static std::string gestureName(const VeltoHost::HidEvent& event);
-    // "none", "middle", "bottom", "top" from the event's y.
-    static std::string regionName(double y);
-
 private:
     bool _jsonLines;
     std::uint64_t _originTicks;
