@@ -1,4 +1,4 @@
-#include "ToolProcess.h"
+#include "ToolProcessSupport.h"
 #include "ToolTestSupport.h"
 
 #include <gtest/gtest.h>
@@ -108,16 +108,23 @@ TEST(HostCommandTest, AStopEndsTheFlowBeforeTheEndIsReadAndSaved)
     ToolProcess host({"host", "--device", "sim:" + recording.string(), "--speed", "8", "--jsonl", "--summary",
                       "--get", "Pipeline.DebugInfo", "--save-recording", saved.string()});
     ASSERT_TRUE(host.started());
-    ASSERT_TRUE(host.waitForOutput("\"tap\"")) << host.err();
+    std::string printed;
+    while (auto line = host.readLine(ToolProcess::Seconds(10))) {
+        printed += *line + '\n';
+        if (line->find("\"tap\"") != std::string::npos) break;
+    }
     std::this_thread::sleep_for(300ms);
     host.signal(SIGTERM);
-    ASSERT_EQ(host.finish(), 0) << host.err();
+    const ToolProcess::Result result = host.finish(ToolProcess::Seconds(20));
+    ASSERT_TRUE(result.exited) << result.err;
+    ASSERT_EQ(result.status, 0) << result.err;
+    printed += result.out;
 
-    const std::vector<json> lines = jsonLinesOf(host.out());
+    const std::vector<json> lines = jsonLinesOf(printed);
     auto firstRead = std::find_if(lines.begin(), lines.end(), [](const json& line) { return line.contains("key"); });
-    ASSERT_NE(firstRead, lines.end()) << host.out();
+    ASSERT_NE(firstRead, lines.end()) << printed;
     EXPECT_TRUE(std::none_of(firstRead, lines.end(), [](const json& line) { return line.contains("gesture"); }))
-        << "an event line follows a property read:\n" << host.out();
+        << "an event line follows a property read:\n" << printed;
 
     // What was printed, what was counted and what was saved describe the
     // same reports: every printed tap is counted, and no event comes from a
@@ -142,16 +149,19 @@ TEST(HostCommandTest, AStopWhileLoadingExitsAtOnceWithOneLine)
     ASSERT_EQ(::mkfifo(fifo.c_str(), 0600), 0);
     ToolProcess host({"host", "--device", "sim:" + fifo.string()});
     ASSERT_TRUE(host.started());
+    ToolProcess::Result result;
     {
         // Opening the writing end waits for the host to open the reading end:
         // from then on the host is loading, and the recording never ends.
         std::ofstream writer(fifo);
         writer << R"({"Version": 1, "Frames": [)" << std::flush;
         host.signal(SIGTERM);
-        EXPECT_EQ(host.finish(5s), 0) << host.err();
+        result = host.finish(ToolProcess::Seconds(5));
     }
-    EXPECT_EQ(host.err(), "veltotouch: stopped while loading " + fifo.string() + "\n");
-    EXPECT_EQ(host.out(), "");
+    ASSERT_TRUE(result.exited) << "ended by signal " << result.signal;
+    EXPECT_EQ(result.status, 0);
+    EXPECT_EQ(result.err, "veltotouch: stopped while loading " + fifo.string() + "\n");
+    EXPECT_EQ(result.out, "");
 }
 
 TEST(HostCommandTest, WhatCannotWorkIsRefusedBeforeTheFirstReport)
@@ -206,14 +216,16 @@ TEST(HostCommandTest, ACopiedToolFindsItsModuleOrSaysWhereItLooked)
     fs::permissions(copy, fs::perms::owner_all);
     const std::vector<std::string> arguments{"host", "--device", "sim:" + kExamples + "/taps.json", "--speed", "0"};
 
-    ToolProcess copied(arguments);
+    ToolProcess copied(arguments, ProcessSetup::copy(copy.string()));
     ASSERT_TRUE(copied.started());
-    EXPECT_EQ(copied.finish(), 0) << copied.err();
-    EXPECT_NE(copied.out().find("tap"), std::string::npos);
+    const ToolProcess::Result found = copied.finish(ToolProcess::Seconds(20));
+    EXPECT_EQ(found.status, 0) << found.err;
+    EXPECT_NE(found.out.find("tap"), std::string::npos);
 
-    ToolProcess misdirected(arguments, {"VELTOTOUCH_PLUGIN=/nonexistent/module.so"});
-    EXPECT_EQ(misdirected.finish(), 1);
-    EXPECT_EQ(misdirected.err(),
+    ToolProcess misdirected(arguments, ProcessSetup::copy(copy.string(), {"VELTOTOUCH_PLUGIN=/nonexistent/module.so"}));
+    const ToolProcess::Result missing = misdirected.finish(ToolProcess::Seconds(20));
+    EXPECT_EQ(missing.status, 1);
+    EXPECT_EQ(missing.err,
               "veltotouch: plug-in module not found; looked in /nonexistent/module.so (VELTOTOUCH_PLUGIN) (give "
               "--plugin PATH or set VELTOTOUCH_PLUGIN)\n");
 }

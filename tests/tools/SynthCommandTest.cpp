@@ -76,7 +76,7 @@ TEST(SynthCommand, LongScriptsAreWrittenInBoundedMemory)
     TempDir dir;
     const fs::path output = dir.file("long.json");
     ToolProcess tool({"synth", "hold top 300s", "--frame-period", "1", "-o", output.string()},
-                     ProcessLimits{64u << 20, std::nullopt});
+                     ProcessSetup::addressSpace(64u << 20));
     ASSERT_TRUE(tool.started());
     const ToolProcess::Result result = tool.finish(ToolProcess::Seconds(120));
     EXPECT_EQ(result.status, 0) << result.err;
@@ -104,7 +104,7 @@ TEST(SynthCommand, OutputsThatCannotBeWrittenFailAtOnce)
     };
     for (const Case& c : cases) {
         ToolProcess tool({"synth", "hold top 3600s", "--frame-period", "1", "-o", c.output},
-                         ProcessLimits{64u << 20, std::nullopt});
+                         ProcessSetup::addressSpace(64u << 20));
         ASSERT_TRUE(tool.started());
         const ToolProcess::Result result = tool.finish(ToolProcess::Seconds(120));
         EXPECT_EQ(result.status, 1) << c.output;
@@ -117,7 +117,7 @@ TEST(SynthCommand, AWriteThatFailsHalfwayLeavesNoHalfContainer)
     TempDir dir;
     const fs::path output = dir.file("cut.json");
     // Writes past 64 KiB fail with "File too large".
-    ToolProcess tool({"synth", "hold top 60s", "-o", output.string()}, ProcessLimits{std::nullopt, 64u << 10});
+    ToolProcess tool({"synth", "hold top 60s", "-o", output.string()}, ProcessSetup::fileSize(64u << 10));
     ASSERT_TRUE(tool.started());
     const ToolProcess::Result result = tool.finish(ToolProcess::Seconds(120));
     EXPECT_EQ(result.status, 1);

@@ -13,14 +13,41 @@
 
 #include <chrono>
 #include <optional>
+#include <utility>
 #include <string>
 #include <vector>
 
 namespace VeltoTool::Testing {
 
-struct ProcessLimits {
+// How the process is started: limits, extra environment entries ("NAME=VALUE")
+// and, when not the built tool itself, another copy of it.
+struct ProcessSetup {
     std::optional<rlim_t> addressSpaceBytes;
     std::optional<rlim_t> fileSizeBytes;
+    std::vector<std::string> environment;
+    std::string program = VELTO_TOOL_PATH;
+
+    // One field each, without naming the others (GCC warns of a designated
+    // initializer that leaves members out).
+    static ProcessSetup addressSpace(rlim_t bytes)
+    {
+        ProcessSetup setup;
+        setup.addressSpaceBytes = bytes;
+        return setup;
+    }
+    static ProcessSetup fileSize(rlim_t bytes)
+    {
+        ProcessSetup setup;
+        setup.fileSizeBytes = bytes;
+        return setup;
+    }
+    static ProcessSetup copy(std::string program, std::vector<std::string> environment = {})
+    {
+        ProcessSetup setup;
+        setup.program = std::move(program);
+        setup.environment = std::move(environment);
+        return setup;
+    }
 };
 
 class ToolProcess {
@@ -36,11 +63,11 @@ public:
         std::string err;
     };
 
-    explicit ToolProcess(const std::vector<std::string>& arguments, const ProcessLimits& limits = {})
+    explicit ToolProcess(const std::vector<std::string>& arguments, ProcessSetup limits = {})
     {
         int outPipe[2], errPipe[2];
         if (::pipe(outPipe) != 0 || ::pipe(errPipe) != 0) return;
-        std::vector<std::string> argv{VELTO_TOOL_PATH};
+        std::vector<std::string> argv{limits.program};
         argv.insert(argv.end(), arguments.begin(), arguments.end());
         std::vector<char*> pointers;
         for (std::string& argument : argv) pointers.push_back(argument.data());
@@ -65,6 +92,7 @@ public:
                 rlimit limit{*limits.fileSizeBytes, *limits.fileSizeBytes};
                 ::setrlimit(RLIMIT_FSIZE, &limit);
             }
+            for (std::string& entry : limits.environment) ::putenv(entry.data());
             ::execv(pointers[0], pointers.data());
             ::_exit(127);
         }
