@@ -1,0 +1,196 @@
+#include "BusClient.h"
+
+#include "host/BusService.h"
+#include "platform/MonotonicClock.h"
+
+#include <systemd/sd-bus.h>
+
+#include <cstring>
+
+using VeltoHost::BusService;
+
+namespace {
+
+// A reply for a whole recording can take a while on a loaded machine.
+constexpr std::uint64_t kCallTimeoutUs = 30'000'000;
+
+BusClient::Reply replyOf(int result, sd_bus_error& error)
+{
+    BusClient::Reply reply;
+    if (result < 0) {
+        reply.error = sd_bus_error_is_set(&error) ? error.name : "errno";
+        reply.message = error.message ? error.message : std::strerror(-result);
+    }
+    return reply;
+}
+
+}  // namespace
+
+BusClient::BusClient(const std::string& address)
+{
+    sd_bus* bus = nullptr;
+    int result = sd_bus_new(&bus);
+    if (result >= 0) result = sd_bus_set_address(bus, address.c_str());
+    if (result >= 0) result = sd_bus_set_bus_client(bus, 1);
+    if (result >= 0) result = sd_bus_start(bus);
+    if (result < 0) {
+        _connectError = std::string("cannot connect to ") + address + ": " + std::strerror(-result);
+        sd_bus_unref(bus);
+        return;
+    }
+    sd_bus_set_method_call_timeout(bus, kCallTimeoutUs);
+    _bus = bus;
+}
+
+BusClient::~BusClient()
+{
+    sd_bus_slot_unref(_match);
+    sd_bus_flush_close_unref(_bus);
+}
+
+BusClient::Reply BusClient::call(const std::string& path, const std::string& interface, const std::string& member,
+                                 const std::vector<std::string>& arguments)
+{
+    sd_bus_message* message = nullptr;
+    sd_bus_message* answer = nullptr;
+    sd_bus_error error = SD_BUS_ERROR_NULL;
+    int result = sd_bus_message_new_method_call(_bus, &message, BusService::kBusName, path.c_str(), interface.c_str(),
+                                                member.c_str());
+    for (const std::string& argument : arguments) {
+        if (result >= 0) result = sd_bus_message_append_basic(message, 's', argument.c_str());
+    }
+    if (result >= 0) result = sd_bus_call(_bus, message, 0, &error, &answer);
+    Reply reply = replyOf(result, error);
+    if (result >= 0) {
+        const char* text = nullptr;
+        if (sd_bus_message_peek_type(answer, nullptr, nullptr) > 0 && sd_bus_message_read_basic(answer, 's', &text) > 0) {
+            reply.value = text;
+        }
+    }
+    sd_bus_error_free(&error);
+    sd_bus_message_unref(answer);
+    sd_bus_message_unref(message);
+    drain();
+    return reply;
+}
+
+BusClient::Reply BusClient::getProperty(const std::string& path, const std::string& key)
+{
+    return call(path, BusService::kDeviceInterface, "GetProperty", {key});
+}
+
+BusClient::Reply BusClient::setProperty(const std::string& path, const std::string& key, const std::string& json)
+{
+    return call(path, BusService::kDeviceInterface, "SetProperty", {key, json});
+}
+
+BusClient::Reply BusClient::saveRecording(const std::string& path, const std::string& file)
+{
+    return call(path, BusService::kDeviceInterface, "SaveRecording", {file});
+}
+
+std::vector<std::string> BusClient::listDevices(std::string* errorName)
+{
+    sd_bus_message* answer = nullptr;
+    sd_bus_error error = SD_BUS_ERROR_NULL;
+    const int result = sd_bus_call_method(_bus, BusService::kBusName, BusService::kManagerPath,
+                                          BusService::kManagerInterface, "ListDevices", &error, &answer, "");
+    std::vector<std::string> paths;
+    if (result < 0) {
+        if (errorName) *errorName = replyOf(result, error).error;
+    } else if (sd_bus_message_enter_container(answer, 'a', "o") > 0) {
+        const char* path = nullptr;
+        while (sd_bus_message_read_basic(answer, 'o', &path) > 0) paths.emplace_back(path);
+        sd_bus_message_exit_container(answer);
+    }
+    sd_bus_error_free(&error);
+    sd_bus_message_unref(answer);
+    drain();
+    return paths;
+}
+
+BusClient::Reply BusClient::name(const std::string& path)
+{
+    sd_bus_error error = SD_BUS_ERROR_NULL;
+    char* text = nullptr;
+    const int result = sd_bus_get_property_string(_bus, BusService::kBusName, path.c_str(), BusService::kDeviceInterface,
+                                                  "Name", &error, &text);
+    Reply reply = replyOf(result, error);
+    if (text) reply.value = text;
+    free(text);
+    sd_bus_error_free(&error);
+    drain();
+    return reply;
+}
+
+std::string BusClient::requestServiceName()
+{
+    const int result = sd_bus_request_name(_bus, BusService::kBusName, 0);
+    if (result >= 0) return {};
+    return result == -EACCES ? "org.freedesktop.DBus.Error.AccessDenied" : std::strerror(-result);
+}
+
+bool BusClient::watchSignals()
+{
+    const std::string rule = std::string("type='signal',path_namespace='") + BusService::kManagerPath + "'";
+    return sd_bus_add_match(_bus, &_match, rule.c_str(), &BusClient::onSignal, this) >= 0;
+}
+
+int BusClient::onSignal(sd_bus_message* message, void* userdata, sd_bus_error*)
+{
+    auto* self = static_cast<BusClient*>(userdata);
+    Signal signal;
+    signal.receivedTicks = VeltoHost::MonotonicClock::now();
+    signal.path = sd_bus_message_get_path(message) ? sd_bus_message_get_path(message) : "";
+    signal.member = sd_bus_message_get_member(message) ? sd_bus_message_get_member(message) : "";
+    if (signal.member == "Gesture") {
+        const char* gesture = nullptr;
+        const char* region = nullptr;
+        if (sd_bus_message_read(message, "ssuuuit", &gesture, &region, &signal.frame, &signal.phase,
+                                &signal.eventMask, &signal.y, &signal.timestamp) < 0) {
+            signal.member += " (unreadable)";
+        } else {
+            signal.gesture = gesture;
+            signal.region = region;
+        }
+    } else if (signal.member == "DeviceReset") {
+        if (sd_bus_message_read(message, "t", &signal.timestamp) < 0) signal.member += " (unreadable)";
+    } else if (signal.member == "DeviceAdded" || signal.member == "DeviceRemoved") {
+        const char* object = nullptr;
+        if (sd_bus_message_read(message, "o", &object) < 0) {
+            signal.member += " (unreadable)";
+        } else {
+            signal.object = object;
+        }
+    }
+    self->_signals.push_back(std::move(signal));
+    return 0;
+}
+
+void BusClient::drain()
+{
+    while (_bus && sd_bus_process(_bus, nullptr) > 0) {
+    }
+}
+
+bool BusClient::waitUntil(const std::function<bool()>& done, std::chrono::milliseconds limit)
+{
+    const auto deadline = std::chrono::steady_clock::now() + limit;
+    for (;;) {
+        drain();
+        if (done()) return true;
+        const auto now = std::chrono::steady_clock::now();
+        if (now >= deadline) return false;
+        const auto left = std::chrono::duration_cast<std::chrono::microseconds>(deadline - now);
+        if (sd_bus_wait(_bus, static_cast<std::uint64_t>(left.count())) < 0) return false;
+    }
+}
+
+std::vector<BusClient::Signal> BusClient::signalsNamed(const std::string& member) const
+{
+    std::vector<Signal> found;
+    for (const Signal& signal : _signals) {
+        if (signal.member == member) found.push_back(signal);
+    }
+    return found;
+}

@@ -1,0 +1,149 @@
+#include "AttachedDevice.h"
+#include "BusClient.h"
+#include "PrivateBus.h"
+
+#include "host/BusService.h"
+
+#include <gtest/gtest.h>
+
+#include <grp.h>
+#include <pwd.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <string>
+#include <vector>
+
+using namespace VeltoHost;
+
+namespace {
+
+constexpr const char* kAccessDenied = "org.freedesktop.DBus.Error.AccessDenied";
+
+// What the unprivileged client found, one bit per expectation that held.
+enum Finding : int {
+    kMayList = 1 << 0,
+    kMayGet = 1 << 1,
+    kMayReadName = 1 << 2,
+    kSetDenied = 1 << 3,
+    kSaveDenied = 1 << 4,
+    kOwnDenied = 1 << 5,
+    kReceivesSignals = 1 << 6,
+};
+
+struct Expectation {
+    Finding finding;
+    const char* what;
+};
+
+const Expectation kExpectations[] = {
+    {kMayList, "may call ListDevices"},
+    {kMayGet, "may call GetProperty"},
+    {kMayReadName, "may read the Name property"},
+    {kSetDenied, "is refused SetProperty"},
+    {kSaveDenied, "is refused SaveRecording"},
+    {kOwnDenied, "may not own the service's name"},
+    {kReceivesSignals, "receives the device's signals"},
+};
+
+// Runs in the forked child, as `uid`/`gid`: no test macros, only the exit code.
+int probeAsUnprivileged(const std::string& address, const std::string& device, const std::string& file, uid_t uid,
+                        gid_t gid, int readyFd, int goFd)
+{
+    if (::setgroups(0, nullptr) != 0 || ::setgid(gid) != 0 || ::setuid(uid) != 0 || ::getuid() != uid) return 0x80;
+    BusClient client(address);
+    if (!client.connected()) {
+        std::fprintf(stderr, "unprivileged client: %s\n", client.connectError().c_str());
+        return 0x80;
+    }
+    int found = 0;
+    std::string listError;
+    if (client.listDevices(&listError) == std::vector<std::string>{device} && listError.empty()) found |= kMayList;
+    const BusClient::Reply got = client.getProperty(device, "Pipeline.Algs.HoldTimeoutMilliseconds");
+    if (got.error.empty() && !got.value.empty()) found |= kMayGet;
+    if (client.name(device).value == "sim:policy.json") found |= kMayReadName;
+    if (client.setProperty(device, "Pipeline.Algs.HoldTimeoutMilliseconds", "1").error == kAccessDenied) {
+        found |= kSetDenied;
+    }
+    if (client.saveRecording(device, file).error == kAccessDenied) found |= kSaveDenied;
+    if (client.requestServiceName() == kAccessDenied) found |= kOwnDenied;
+
+    if (client.watchSignals()) {
+        client.listDevices();  // a round trip: the match is in place at the bus from here on
+        const char ready = 'r';
+        if (::write(readyFd, &ready, 1) == 1) {
+            char go = 0;
+            if (::read(goFd, &go, 1) == 1 &&
+                client.waitUntil([&] { return !client.signalsNamed("DeviceReset").empty(); })) {
+                found |= kReceivesSignals;
+            }
+        }
+    }
+    return found;
+}
+
+}  // namespace
+
+TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwn)
+{
+    if (::geteuid() != 0) {
+        GTEST_SKIP() << "the policy check drops a child to an unprivileged user, which needs root; running as uid "
+                     << ::geteuid();
+    }
+    const passwd* nobody = ::getpwnam("nobody");
+    const uid_t uid = nobody ? nobody->pw_uid : 65534;
+    const gid_t gid = nobody ? nobody->pw_gid : 65534;
+
+    PrivateBus bus(PrivateBus::systemPolicy(), "system", VELTO_BUS_POLICY_FILE);
+    ASSERT_FALSE(bus.address().empty()) << bus.error();
+    BusService service(BusConnection::Address::at(bus.address()));
+    AttachedDevice device(service, "sim:policy.json");
+    const std::string file = bus.directory() + "/saved.json";
+
+    // Root may do everything the service offers.
+    {
+        BusClient root(bus.address());
+        ASSERT_TRUE(root.connected()) << root.connectError();
+        EXPECT_EQ(root.setProperty(device.path(), "Pipeline.Algs.HoldTimeoutMilliseconds", "600").error, "");
+        EXPECT_EQ(root.getProperty(device.path(), "Pipeline.Algs.HoldTimeoutMilliseconds").value, "600");
+        EXPECT_EQ(root.saveRecording(device.path(), file).error, "");
+        EXPECT_TRUE(std::filesystem::exists(file));
+        std::filesystem::remove(file);
+    }
+
+    int ready[2];
+    int go[2];
+    ASSERT_EQ(::pipe(ready), 0);
+    ASSERT_EQ(::pipe(go), 0);
+    const pid_t child = ::fork();
+    ASSERT_GE(child, 0) << std::strerror(errno);
+    if (child == 0) ::_exit(probeAsUnprivileged(bus.address(), device.path(), file, uid, gid, ready[1], go[0]));
+    ::close(ready[1]);
+    ::close(go[0]);
+    char signalled = 0;
+    if (::read(ready[0], &signalled, 1) == 1) {
+        service.publishEvent(device.id(), HidEvent::createVendorDefinedEvent(7, 0xFF60, 2, 0, nullptr, 0, 0));
+        const char start = 'g';
+        EXPECT_EQ(::write(go[1], &start, 1), 1);
+    }
+    int status = 0;
+    while (::waitpid(child, &status, 0) < 0 && errno == EINTR) {
+    }
+    ::close(ready[0]);
+    ::close(go[1]);
+    ASSERT_TRUE(WIFEXITED(status));
+    const int found = WEXITSTATUS(status);
+    ASSERT_NE(found, 0x80) << "the child could not become uid " << uid << " or reach the bus";
+    for (const Expectation& expectation : kExpectations) {
+        EXPECT_TRUE(found & expectation.finding) << "an unprivileged user " << expectation.what;
+    }
+    // The refused write did not land.
+    PropertyValue timeout;
+    ASSERT_TRUE(device.control().getProperty("Pipeline.Algs.HoldTimeoutMilliseconds", timeout).isOk());
+    EXPECT_EQ(timeout.toUInt64(), 600u);
+    EXPECT_FALSE(std::filesystem::exists(file));
+}
