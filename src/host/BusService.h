@@ -27,6 +27,9 @@ namespace VeltoHost {
 //       signals Gesture(s gesture, s region, u frame, u phase, u eventMask,
 //       i y, t timestamp), DeviceReset(t timestamp)
 //
+// Values travel as compact JSON text both ways, so a text property such as
+// "Recording" (itself the JSON of a recording) reads as a JSON string.
+//
 // N counts attachments from 0 and is never reused, so a path seen in a
 // DeviceRemoved signal never comes back meaning another device.
 //
@@ -37,6 +40,10 @@ namespace VeltoHost {
 // queue): it only queues the signal and wakes the connection's thread, so
 // the plug-in's deliveries never wait for the bus. A device's signals go out
 // in the order they were published, and before its DeviceRemoved.
+//
+// Taking a device apart: stop its events reaching publishEvent (unsubscribe
+// and drain the host's queue), removeDevice, then stop the device. The
+// service itself goes last, after every publisher has stopped.
 //
 // A request, however malformed, is answered with an error and never reaches
 // further than the device's control: nothing here stops the service.
