@@ -168,8 +168,14 @@ BusService::BusService(const BusConnection::Address& address) : _connection(addr
 {
     // Objects first, name last: a client that sees the name appear finds
     // the manager already there.
-    serveManager();
-    requestName();
+    try {
+        serveManager();
+        requestName();
+    } catch (...) {
+        // The slot holds a reference to the connection, which would keep it open.
+        sd_bus_slot_unref(_managerSlot);
+        throw;
+    }
     _connection.start();
     busLog().log("serving %s on %s as %s", kBusName, address.description(), _connection.uniqueName());
 }

@@ -17,6 +17,7 @@
 #include <filesystem>
 #include <memory>
 #include <optional>
+#include <stdexcept>
 #include <string>
 #include <thread>
 #include <vector>
@@ -312,6 +313,29 @@ TEST_F(BusServiceTest, SavedRecordingIsTheDevicesRecordingAndPrivate)
     for ([[maybe_unused]] const auto& entry : std::filesystem::directory_iterator(directory)) ++entries;
     EXPECT_EQ(entries, 1u);
     std::filesystem::remove_all(directory);
+}
+
+TEST_F(BusServiceTest, ASecondServiceIsRefusedTheNameAndAnAbsentBusIsNamed)
+{
+    struct Case {
+        BusConnection::Address address;
+        const char* message;
+    };
+    const Case cases[] = {
+        {BusConnection::Address::at(_bus.address()), "already owned"},
+        {BusConnection::Address::at("unix:path=" + _bus.directory() + "/no_socket"), "cannot connect to the bus at"},
+    };
+    for (const Case& c : cases) {
+        try {
+            BusService second(c.address);
+            ADD_FAILURE() << "a second service started on " << c.address.description();
+        } catch (const std::runtime_error& error) {
+            EXPECT_NE(std::string(error.what()).find(c.message), std::string::npos) << error.what();
+        }
+    }
+    // The first service is unharmed.
+    AttachedDevice& device = attach("sim:still.json");
+    EXPECT_EQ(_client->listDevices(), (std::vector<std::string>{device.path()}));
 }
 
 TEST_F(BusServiceTest, EventsOfARemovedDeviceAreNotSent)
