@@ -53,7 +53,7 @@ BusClient::Reply BusClient::call(const std::string& path, const std::string& int
 {
     sd_bus_message* message = nullptr;
     sd_bus_message* answer = nullptr;
-    sd_bus_error error = SD_BUS_ERROR_NULL;
+    sd_bus_error error{};  // all null: no error set
     int result = sd_bus_message_new_method_call(_bus, &message, BusService::kBusName, path.c_str(), interface.c_str(),
                                                 member.c_str());
     for (const std::string& argument : arguments) {
@@ -92,7 +92,7 @@ BusClient::Reply BusClient::saveRecording(const std::string& path, const std::st
 std::vector<std::string> BusClient::listDevices(std::string* errorName)
 {
     sd_bus_message* answer = nullptr;
-    sd_bus_error error = SD_BUS_ERROR_NULL;
+    sd_bus_error error{};  // all null: no error set
     const int result = sd_bus_call_method(_bus, BusService::kBusName, BusService::kManagerPath,
                                           BusService::kManagerInterface, "ListDevices", &error, &answer, "");
     std::vector<std::string> paths;
@@ -111,7 +111,7 @@ std::vector<std::string> BusClient::listDevices(std::string* errorName)
 
 BusClient::Reply BusClient::name(const std::string& path)
 {
-    sd_bus_error error = SD_BUS_ERROR_NULL;
+    sd_bus_error error{};  // all null: no error set
     char* text = nullptr;
     const int result = sd_bus_get_property_string(_bus, BusService::kBusName, path.c_str(), BusService::kDeviceInterface,
                                                   "Name", &error, &text);
