@@ -1,7 +1,6 @@
 #include "EventFormatter.h"
 
-#include "algs/Algs.h"
-#include "host/Gesture.h"
+#include "host/GestureFields.h"
 #include "pipeline/Util.h"
 #include "recording/JsonValue.h"
 
@@ -13,46 +12,34 @@ namespace VeltoTool {
 
 using VeltoHost::HidEvent;
 
-namespace {
-
-std::int64_t frameNumberOf(const HidEvent& event)
-{
-    return event.integerValue(VeltoTouch::Algs::kFrameNumberField).value_or(0);
-}
-
-}  // namespace
-
 std::string EventFormatter::format(const HidEvent& event) const
 {
-    const VeltoHost::Gesture meaning = VeltoHost::Gesture::of(event);
-    const std::string gesture(VeltoHost::Gesture::name(meaning.kind));
-    const std::string region(VeltoHost::Gesture::name(meaning.region));
+    const VeltoHost::GestureFields fields = VeltoHost::GestureFields::of(event);
     if (_jsonLines) {
         nlohmann::ordered_json line;
-        line["gesture"] = gesture;
-        if (event.kind() == HidEvent::Kind::VendorDefined) {
-            line["usagePage"] = event.vendorDefined().usagePage;
-            line["usage"] = event.vendorDefined().usage;
+        line["gesture"] = fields.gesture;
+        if (fields.isDeviceReset) {
+            line["usagePage"] = fields.usagePage;
+            line["usage"] = fields.usage;
         } else {
-            const auto& digitizer = event.digitizer();
-            line["region"] = region;
-            line["frame"] = frameNumberOf(event);
-            line["phase"] = event.phase();
-            line["eventMask"] = digitizer.eventMask;
-            line["y"] = static_cast<std::int64_t>(digitizer.y);
+            line["region"] = fields.region;
+            line["frame"] = fields.frame;
+            line["phase"] = fields.phase;
+            line["eventMask"] = fields.eventMask;
+            line["y"] = fields.y;
         }
-        line["timestamp"] = event.timeStamp();
+        line["timestamp"] = fields.timestamp;
         return line.dump();
     }
 
-    const std::uint64_t elapsedNs = VeltoTouch::Util::nanosecondsFromMachTime(event.timeStamp() - _originTicks);
+    const std::uint64_t elapsedNs = VeltoTouch::Util::nanosecondsFromMachTime(fields.timestamp - _originTicks);
     char text[128];
-    if (event.kind() == HidEvent::Kind::VendorDefined) {
+    if (fields.isDeviceReset) {
         std::snprintf(text, sizeof text, "%9.3fs  %-12s (usage page 0x%X, usage %u)", elapsedNs / 1e9,
-                      gesture.c_str(), event.vendorDefined().usagePage, event.vendorDefined().usage);
+                      fields.gesture.c_str(), fields.usagePage, fields.usage);
     } else {
-        std::snprintf(text, sizeof text, "%9.3fs  %-12s %-7s frame %lld", elapsedNs / 1e9, gesture.c_str(),
-                      region.c_str(), static_cast<long long>(frameNumberOf(event)));
+        std::snprintf(text, sizeof text, "%9.3fs  %-12s %-7s frame %lld", elapsedNs / 1e9, fields.gesture.c_str(),
+                      fields.region.c_str(), static_cast<long long>(fields.frame));
     }
     return text;
 }

@@ -1,21 +1,15 @@
 #include "host/GestureFields.h"
 
 #include "algs/Algs.h"
+#include "host/Gesture.h"
 
 namespace VeltoHost {
 
-namespace {
-
-// A tap is the one gesture without a phase; the recogniser marks it in the
-// event mask instead.
-constexpr std::uint32_t kTapEventMask = 0x00020000;
-
-}  // namespace
-
 GestureFields GestureFields::of(const HidEvent& event)
 {
+    const Gesture meaning = Gesture::of(event);
     GestureFields fields;
-    fields.gesture = gestureName(event);
+    fields.gesture = Gesture::name(meaning.kind);
     fields.timestamp = event.timeStamp();
     if (event.kind() == HidEvent::Kind::VendorDefined) {
         fields.isDeviceReset = true;
@@ -24,34 +18,12 @@ GestureFields GestureFields::of(const HidEvent& event)
         return fields;
     }
     const HidEvent::Digitizer& digitizer = event.digitizer();
-    fields.region = regionName(digitizer.y);
+    fields.region = Gesture::name(meaning.region);
     fields.frame = event.integerValue(VeltoTouch::Algs::kFrameNumberField).value_or(0);
     fields.phase = event.phase();
     fields.eventMask = digitizer.eventMask;
     fields.y = static_cast<std::int64_t>(digitizer.y);
     return fields;
-}
-
-std::string GestureFields::gestureName(const HidEvent& event)
-{
-    if (event.kind() == HidEvent::Kind::VendorDefined) return "device-reset";
-    switch (event.phase()) {
-    case HidEvent::kPhaseMayBegin: return "may-begin";
-    case HidEvent::kPhaseBegan: return "hold-start";
-    case HidEvent::kPhaseChanged: return "hold-change";
-    case HidEvent::kPhaseEnded: return "hold-end";
-    case HidEvent::kPhaseCancelled: return "cancel";
-    case 0: return (event.digitizer().eventMask & kTapEventMask) ? "tap" : "unknown";
-    default: return "unknown";
-    }
-}
-
-std::string GestureFields::regionName(double y)
-{
-    if (y == 1.0) return "middle";
-    if (y == 2.0) return "bottom";
-    if (y == 3.0) return "top";
-    return "none";
 }
 
 }  // namespace VeltoHost

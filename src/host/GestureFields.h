@@ -33,10 +33,8 @@ struct GestureFields {
     // Host clock ticks, as the pipeline stamped the event.
     std::uint64_t timestamp = 0;
 
+    // Names as Gesture gives them.
     static GestureFields of(const HidEvent& event);
-
-    static std::string gestureName(const HidEvent& event);
-    static std::string regionName(double y);
 };
 
 }  // namespace VeltoHost

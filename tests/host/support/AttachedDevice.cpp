@@ -60,7 +60,7 @@ std::uint64_t AttachedDevice::play(const std::string& recordingPath)
         [this](const std::string& key, const PropertyValue& value) {
             _control->setPropertyUnchecked(kPipelineDomain + key, value);
         },
-        [] { return false; }, {0.0, 1'000'000, 512});
+        [] { return false; }, {0.0, 512});
     for (const auto& frame : recording.frames()) player.play(frame);
     player.waitUntilTaken();
     return player.reportsPushed();
