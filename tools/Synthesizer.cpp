@@ -70,7 +70,9 @@ void Synthesizer::touch(const GestureScript::Step& step)
     const ContactModel::Point from = ContactModel::regionCentre(step.from);
     const ContactModel::Point to = ContactModel::regionCentre(step.to);
     constexpr std::uint32_t kNoReset = UINT32_MAX;
-    const std::uint32_t resetFrame = step.resetAtMs ? frameCount(*step.resetAtMs) : kNoReset;
+    // A reset time that rounds to the end of the touch is still within it: it
+    // comes before the last frame rather than not at all.
+    const std::uint32_t resetFrame = step.resetAtMs ? std::min(frameCount(*step.resetAtMs), frames - 1) : kNoReset;
     for (std::uint32_t i = 0; i < frames; ++i) {
         if (resetFrame == i) resetReport();
         // Pressure ramps up at the start and down at the end of the touch.
