@@ -4,7 +4,8 @@
 // at most one gesture event per image (plus the vendor event of a reset), every
 // event stamped with the time the recorder handed on and tagged with its
 // frame, the counters never falling except through a reset of the statistics,
-// and every call recorded as it was made.
+// every call recorded as it was made, and the recording, replayed into a new
+// pipeline, giving the same events again.
 //
 // Input: a sequence of operations, each introduced by one byte:
 //   1 N                   the last image again N+1 times, frame number and device
@@ -37,6 +38,7 @@
 #include <numeric>
 #include <optional>
 #include <string>
+#include <tuple>
 #include <type_traits>
 #include <vector>
 
@@ -105,6 +107,15 @@ std::string decodeKey(FuzzInput& in)
 
 bool sameBits(float a, float b) { return std::memcmp(&a, &b, sizeof a) == 0; }
 
+// An event as the host tells it apart; the time stamps of a replay differ.
+using Gesture = std::tuple<HidEvent::Kind, std::uint16_t, double, std::optional<std::int64_t>, std::uint32_t>;
+
+Gesture gestureOf(const HidEvent& event)
+{
+    return {event.kind(), event.phase(), event.digitizer().y,
+            event.integerValue(VeltoTouch::Algs::kFrameNumberField), event.vendorDefined().usage};
+}
+
 // What the pipeline's probes saw during one operation.
 struct Observed {
     int setTimeCalls = 0;
@@ -135,6 +146,7 @@ public:
         _pipeline->hidEventsProbe = [this](const HidEventList& events) {
             ++_seen.eventBatches;
             _seen.events.insert(_seen.events.end(), events.begin(), events.end());
+            for (const auto& event : events) _liveEvents.push_back(gestureOf(*event));
         };
         _pipeline->invalidInputReportProbe = [this](const std::uint8_t*, std::size_t) { ++_seen.invalidReports; };
         _counters = counters();
@@ -167,6 +179,7 @@ public:
             }
         }
         checkCountersByKey();
+        checkReplayMatches();
     }
 
 private:
@@ -179,6 +192,7 @@ private:
         if (!VeltoTouch::Util::stripDomainFromKey(key, "Pipeline")) return;
         _seen = Observed{};
         _recording.setState(key, value);
+        ++_recordedCalls;
 
         VELTO_FUZZ_CHECK(_seen.setTimeCalls == 1);
         VELTO_FUZZ_CHECK(_seen.setStateCalls == 1);
@@ -268,6 +282,7 @@ private:
     {
         _seen = Observed{};
         _recording.handleInputReport(report.data(), report.size());
+        ++_recordedCalls;
 
         VELTO_FUZZ_CHECK(_seen.setTimeCalls == 1);
         VELTO_FUZZ_CHECK(_seen.setStateCalls == 0);
@@ -308,6 +323,25 @@ private:
         }
         _counters = now;
         checkDebugInfo();
+    }
+
+    // A recording is there to reproduce what happened: played into a new
+    // pipeline, an untrimmed recording must give the same events as the live
+    // one did.
+    void checkReplayMatches()
+    {
+        if (_recording.frames().size() != _recordedCalls) return;  // trimmed
+        PipelineRecording copy = _recording;
+        auto replayed = std::make_shared<Pipeline>();
+        std::vector<Gesture> events;
+        replayed->hidEventsProbe = [&events](const HidEventList& list) {
+            for (const auto& event : list) events.push_back(gestureOf(*event));
+        };
+        copy.pipeline = replayed;
+        copy.sleepMicroseconds = [](std::uint64_t) {};
+        copy.playReset();
+        while (copy.playCanContinue()) copy.playNextFrame(1.0f);
+        VELTO_FUZZ_CHECK(events == _liveEvents);
     }
 
     // The recogniser's frame of the reset may end a gesture; the vendor event
@@ -376,6 +410,8 @@ private:
     std::optional<InputReport::Image> _lastImage;
     std::uint32_t _resets = 0;
     std::uint32_t _disjointImages = 0;
+    std::vector<Gesture> _liveEvents;
+    std::size_t _recordedCalls = 0;
 };
 
 }  // namespace
