@@ -51,6 +51,16 @@ const CLI::Validator& settingCheck()
     return check;
 }
 
+// A device is a hidraw path or sim:FILE; "sim:" alone names no recording.
+const CLI::Validator& deviceCheck()
+{
+    static const CLI::Validator check = argumentCheck("sim:FILE|/dev/hidrawN", [](const std::string& argument) {
+        if (argument == "sim:") throw ToolError("sim: needs a recording after the colon (sim:FILE)");
+        if (argument.empty()) throw ToolError("expected sim:FILE or /dev/hidrawN, got nothing");
+    });
+    return check;
+}
+
 const CLI::Validator& speedCheck()
 {
     static const FiniteNumberCheck check(kSlowestSpeed, /*zeroAllowed=*/true);
@@ -126,7 +136,9 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     HostCommand::Options host;
     std::vector<std::string> hostSets;
     auto* hostCommand = app.add_subcommand("host", "Run the plug-in in the host against a simulated or a real device");
-    hostCommand->add_option("--device", host.device, "sim:FILE (a recording played as a device) or /dev/hidrawN")->required();
+    hostCommand->add_option("--device", host.device, "sim:FILE (a recording played as a device) or /dev/hidrawN")
+        ->required()
+        ->check(deviceCheck());
     hostCommand->add_option("--plugin", host.plugin,
                             "Plug-in module to load (default: $VELTOTOUCH_PLUGIN, else the installed or built module)");
     hostCommand->add_option("--speed", host.speed, "Simulated device: play S times faster than recorded")->capture_default_str()->check(speedCheck());

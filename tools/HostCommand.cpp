@@ -77,7 +77,6 @@ std::optional<Device> openDevice(const std::string& name)
     Device device;
     if (name.rfind(kSimulatedPrefix, 0) == 0) {
         const std::string path = name.substr(std::strlen(kSimulatedPrefix));
-        if (path.empty()) throw ToolError("--device sim: needs a recording after the colon (sim:FILE)");
         device.recording = ToolFiles::readRecordingUnlessStopped(path, &StopSignals::requested);
         if (!device.recording) return std::nullopt;
         device.simulated = SimulatedHostDevice::create();

@@ -183,7 +183,6 @@ TEST(HostCommandTest, WhatCannotWorkIsRefusedBeforeTheFirstReport)
         {{"--device", dir.path().string()},
          "veltotouch: " + dir.path().string() +
              " is a directory; expected a hidraw device node (/dev/hidrawN) or sim:FILE\n"},
-        {{"--device", "sim:"}, "veltotouch: --device sim: needs a recording after the colon (sim:FILE)\n"},
         {{"--device", demo, "--save-recording", "/no/such/dir/r.json"},
          "veltotouch: /no/such/dir/r.json: No such file or directory\n"},
     };
@@ -195,6 +194,15 @@ TEST(HostCommandTest, WhatCannotWorkIsRefusedBeforeTheFirstReport)
         EXPECT_EQ(run.err, c.error);
         EXPECT_EQ(run.out, "") << "the session was played before the refusal";
     }
+}
+
+TEST(HostCommandTest, ADeviceWithoutARecordingIsAUsageError)
+{
+    ToolRun run = runTool({"host", "--device", "sim:"});
+    EXPECT_EQ(run.status, 2);
+    EXPECT_EQ(run.err.rfind("veltotouch: --device: sim: needs a recording after the colon (sim:FILE)", 0), 0u)
+        << run.err;
+    EXPECT_EQ(std::count(run.err.begin(), run.err.end(), '\n'), 1);
 }
 
 TEST(HostCommandTest, JsonLinesStayJsonWithTheSummary)
