@@ -1,0 +1,102 @@
+#include "host/DeviceSession.h"
+
+#include "host/Gesture.h"
+#include "host/SimulatedDevicePlayer.h"
+
+#include <stdexcept>
+#include <utility>
+
+namespace VeltoHost {
+
+namespace {
+
+constexpr const char* kFactoryName = "VeltoTouchHIDServiceFactory";
+// A recording's state frames carry the pipeline's own keys; the host reaches
+// them through the plug-in's "Pipeline" domain.
+constexpr const char* kPipelineDomain = "Pipeline.";
+// As-fast-as-possible playback still leaves the device's queue room.
+constexpr std::size_t kMaxQueuedReports = 512;
+
+}  // namespace
+
+DeviceSession::DeviceSession(std::string name, HostDevice::Ref device, const std::string& pluginPath,
+                             Outputs outputs)
+    : _name(std::move(name)), _outputs(std::move(outputs)), _keyMap(_outputs.keys)
+{
+    // Subscribed before the start, so that a real device's first reports are
+    // keyed too; they reach the bus once its object exists (a controller
+    // cannot have subscribed to an object that does not exist yet).
+    _subscription = _host.subscribe([this](const HidEventRef& event) { onEvent(event); });
+    _host.start(pluginPath, kFactoryName, std::move(device));
+    _control = std::make_shared<HostDeviceControl>(_name, _host);
+    if (!_outputs.bus) return;
+    try {
+        _busId = _outputs.bus->addDevice(_control);
+    } catch (...) {
+        // Stopped while the members its deliveries use still exist.
+        _host.stop();
+        throw;
+    }
+}
+
+DeviceSession::~DeviceSession() { takeApart(); }
+
+void DeviceSession::takeApart() noexcept
+{
+    _stopPlaying = true;
+    if (_player.joinable()) _player.join();
+    // Every event the plug-in sent has been published and keyed when this returns.
+    _host.unschedule();
+    _host.unsubscribe(_subscription);
+    sendKeys(_keyMap.releaseAll());
+    if (const auto id = busId()) _outputs.bus->removeDevice(*id);
+    _host.stop();
+}
+
+void DeviceSession::playInBackground(VeltoTouch::PipelineRecording recording, SimulatedHostDevice::Ref device,
+                                     double speed)
+{
+    if (_player.joinable()) throw std::logic_error("a device session plays one recording");
+    _player = std::thread([this, recording = std::move(recording), device = std::move(device), speed]() mutable {
+        play(std::move(recording), std::move(device), speed);
+    });
+}
+
+bool DeviceSession::waitUntilPlayed(std::chrono::nanoseconds timeout)
+{
+    std::unique_lock guard(_playedLock);
+    return _playedChanged.wait_for(guard, timeout, [this] { return _played; });
+}
+
+void DeviceSession::play(VeltoTouch::PipelineRecording recording, SimulatedHostDevice::Ref device, double speed)
+{
+    SimulatedDevicePlayer player(
+        device,
+        [this](const std::string& key, const PropertyValue& value) {
+            _control->setPropertyUnchecked(kPipelineDomain + key, value);
+        },
+        [this] { return _stopPlaying.load(); }, {speed, kMaxQueuedReports});
+    for (const VeltoTouch::PipelineRecording::Frame& frame : recording.frames()) {
+        if (!player.play(frame)) return;
+    }
+    if (!player.waitUntilTaken()) return;
+    std::lock_guard guard(_playedLock);
+    _played = true;
+    _playedChanged.notify_all();
+}
+
+void DeviceSession::onEvent(const HidEventRef& event)
+{
+    if (const auto id = busId()) _outputs.bus->publishEvent(*id, event);
+    sendKeys(_keyMap.handle(Gesture::of(*event)));
+}
+
+void DeviceSession::sendKeys(const KeyMap::Actions& actions)
+{
+    if (actions.empty() || !_outputs.keyboard) return;
+    std::unique_lock<std::mutex> guard;
+    if (_outputs.keyboardLock) guard = std::unique_lock(*_outputs.keyboardLock);
+    _outputs.keyboard->play(actions);
+}
+
+}  // namespace VeltoHost

@@ -1,0 +1,110 @@
+#include "host/DeviceSession.h"
+
+#include "AttachedDevice.h"
+#include "BusClient.h"
+#include "PrivateBus.h"
+
+#include <gtest/gtest.h>
+#include <linux/input-event-codes.h>
+
+#include <mutex>
+#include <string>
+#include <vector>
+
+using namespace VeltoHost;
+using namespace std::chrono_literals;
+using VeltoTouch::PipelineRecording;
+
+namespace {
+
+const std::string kExamples = VELTO_EXAMPLES_DIR;
+
+// Key actions as text, "+KEY_VOLUMEUP" for a press and "-KEY_VOLUMEUP" for a
+// release, in the order the keyboard got them.
+class RecordingKeyboard final : public KeyboardSink {
+public:
+    bool emitKey(unsigned int code, bool pressed) override
+    {
+        std::lock_guard guard(_lock);
+        _actions.push_back((pressed ? "+" : "-") + KeyMap::keyName(code));
+        return true;
+    }
+    bool sync() override { return true; }
+    std::vector<std::string> actions()
+    {
+        std::lock_guard guard(_lock);
+        return _actions;
+    }
+
+private:
+    std::mutex _lock;
+    std::vector<std::string> _actions;
+};
+
+PipelineRecording recordingOf(const std::string& name) { return PipelineRecording{std::string_view(readFile(kExamples + "/" + name))}; }
+
+}  // namespace
+
+TEST(DeviceSessionTest, GesturesBecomeSignalsAndKeysAndAHeldKeyIsReleasedWhenTheDeviceGoes)
+{
+    PrivateBus bus;
+    ASSERT_FALSE(bus.address().empty()) << bus.error();
+    BusService service(BusConnection::Address::at(bus.address()));
+    BusClient client(bus.address());
+    ASSERT_TRUE(client.connected()) << client.connectError();
+    ASSERT_TRUE(client.watchSignals());
+    RecordingKeyboard keyboard;
+    std::mutex keyboardLock;
+    const DeviceSession::Outputs outputs{&service, &keyboard, &keyboardLock, KeyMap::defaultBindings()};
+
+    {
+        SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+        DeviceSession session("sim:taps.json", device, VELTO_SERVICE_MODULE_PATH, outputs);
+        ASSERT_EQ(session.busId(), std::optional<BusService::DeviceId>(0));
+        session.playInBackground(recordingOf("taps.json"), device, 0);
+        ASSERT_TRUE(session.waitUntilPlayed(20s));
+        ASSERT_TRUE(client.waitUntil([&] { return client.signalsNamed("Gesture").size() == 6; }));
+        // Still attached and readable after its recording ended.
+        EXPECT_EQ(client.getProperty(BusService::devicePath(0), "Pipeline.DebugInfo").error, "");
+    }
+    // Taps at the top, in the middle and at the bottom.
+    EXPECT_EQ(keyboard.actions(), (std::vector<std::string>{"+KEY_VOLUMEUP", "-KEY_VOLUMEUP", "+KEY_PLAYPAUSE",
+                                                            "-KEY_PLAYPAUSE", "+KEY_VOLUMEDOWN", "-KEY_VOLUMEDOWN"}));
+    ASSERT_TRUE(client.waitUntil([&] { return client.signalsNamed("DeviceRemoved").size() == 1; }));
+
+    // A hold in the middle cut short by the device going away: the voice
+    // command key is not left down.
+    PipelineRecording holds = recordingOf("holds.json");
+    PipelineRecording::FrameList frames = holds.frames();
+    std::size_t reports = 0;
+    std::erase_if(frames, [&](const PipelineRecording::Frame& frame) {
+        return frame.type == PipelineRecording::Frame::Type::InputReport && ++reports > 250;  // hold-start at frame 217
+    });
+    PipelineRecording cut;
+    for (auto& frame : frames) cut.appendFrame(frame);
+    {
+        SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+        DeviceSession session("sim:holds.json", device, VELTO_SERVICE_MODULE_PATH, outputs);
+        EXPECT_EQ(session.busId(), std::optional<BusService::DeviceId>(1));
+        session.playInBackground(std::move(cut), device, 0);
+        ASSERT_TRUE(session.waitUntilPlayed(20s));
+    }
+    const std::vector<std::string> actions = keyboard.actions();
+    ASSERT_GE(actions.size(), 2u);
+    EXPECT_EQ(std::vector<std::string>(actions.end() - 2, actions.end()),
+              (std::vector<std::string>{"+KEY_VOICECOMMAND", "-KEY_VOICECOMMAND"}));
+}
+
+TEST(DeviceSessionTest, ADeviceThatCannotStartLeavesNoObjectOnTheBus)
+{
+    PrivateBus bus;
+    ASSERT_FALSE(bus.address().empty()) << bus.error();
+    BusService service(BusConnection::Address::at(bus.address()));
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+    device->failOpen(true);
+    EXPECT_THROW(DeviceSession("sim:x", device, VELTO_SERVICE_MODULE_PATH, {&service, nullptr, nullptr, {}}),
+                 std::runtime_error);
+    BusClient client(bus.address());
+    std::string error;
+    EXPECT_TRUE(client.listDevices(&error).empty()) << error;
+}
