@@ -12,21 +12,6 @@ using VeltoHost::PropertyValue;
 
 namespace {
 
-std::string kindName(const PropertyValue& value)
-{
-    if (!value.hasValue()) return "nothing";
-    switch (value.kind()) {
-    case PropertyValue::Kind::Null: return "null";
-    case PropertyValue::Kind::Boolean: return "a boolean";
-    case PropertyValue::Kind::Number: return "a number";
-    case PropertyValue::Kind::String: return "a string";
-    case PropertyValue::Kind::Bytes: return "byte data";
-    case PropertyValue::Kind::Array: return "an array";
-    case PropertyValue::Kind::Dictionary: return "an object";
-    }
-    return "a value";
-}
-
 // The number a value stands for as its shortest text reads: a 32-bit float
 // that holds 0.1 is taken as 0.1, not as 0.100000001490116, so that a setting
 // kept in single precision does not differ from the decimal written to it.
@@ -92,8 +77,8 @@ std::optional<std::string> StateArguments::readBackWarning(const std::string& ke
                "only acted on)";
     }
     if (written.kind() != readBack.kind()) {
-        return key + " was set to " + kindName(written) + " (" + written.description() + ") but reads back " +
-               kindName(readBack) + " (" + readBack.description() + ")";
+        return key + " was set to " + written.kindDescription() + " (" + written.description() + ") but reads back " +
+               readBack.kindDescription() + " (" + readBack.description() + ")";
     }
     return key + " was set to " + written.description() + " but reads back " + readBack.description();
 }

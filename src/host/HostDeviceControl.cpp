@@ -34,21 +34,6 @@ bool isWriteOnly(const std::string& key)
 
 std::string quoted(const std::string& text) { return "'" + text + "'"; }
 
-std::string kindName(const PropertyValue& value)
-{
-    if (!value.hasValue()) return "nothing";
-    switch (value.kind()) {
-    case PropertyValue::Kind::Null: return "null";
-    case PropertyValue::Kind::Boolean: return "a boolean";
-    case PropertyValue::Kind::Number: return "a number";
-    case PropertyValue::Kind::String: return "a string";
-    case PropertyValue::Kind::Bytes: return "byte data";
-    case PropertyValue::Kind::Array: return "an array";
-    case PropertyValue::Kind::Dictionary: return "an object";
-    }
-    return "a value";
-}
-
 bool isIntegerType(PropertyValue::NumberType type)
 {
     return type != PropertyValue::NumberType::Float32 && type != PropertyValue::NumberType::Float64;
@@ -178,7 +163,7 @@ DeviceControl::Result HostDeviceControl::checkWrite(const std::string& key, cons
         return Result::failed("property " + quoted(key) + " is read-only");
     }
     const std::string wrongKind =
-        "property " + quoted(key) + " takes " + kindName(current) + ", not " + kindName(value);
+        "property " + quoted(key) + " takes " + current.kindDescription() + ", not " + value.kindDescription();
     if (current.isBoolean()) {
         // A flag follows the boolean meaning of a number, as recorded sessions set it.
         return value.isNumberOrBoolean() ? Result::ok() : Result::invalidArgument(wrongKind);

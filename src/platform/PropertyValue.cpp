@@ -119,6 +119,21 @@ PropertyValue PropertyValue::dictionary(PropertyDictionary value)
     return PropertyValue(std::make_shared<const Storage>(Storage{std::move(value)}));
 }
 
+const char* PropertyValue::kindDescription() const noexcept
+{
+    if (!hasValue()) return "nothing";
+    switch (kind()) {
+    case Kind::Null: return "null";
+    case Kind::Boolean: return "a boolean";
+    case Kind::Number: return "a number";
+    case Kind::String: return "a string";
+    case Kind::Bytes: return "byte data";
+    case Kind::Array: return "an array";
+    case Kind::Dictionary: return "an object";
+    }
+    return "a value";
+}
+
 PropertyValue::Kind PropertyValue::kind() const noexcept
 {
     if (!_storage) return Kind::Null;

@@ -50,6 +50,9 @@ public:
 
     // Kind of the value; an empty reference reports Null.
     Kind kind() const noexcept;
+    // The kind in words for messages to people ("a number", "an object";
+    // "nothing" for an empty reference).
+    const char* kindDescription() const noexcept;
     bool isNull() const noexcept { return hasValue() && kind() == Kind::Null; }
     bool isBoolean() const noexcept { return hasValue() && kind() == Kind::Boolean; }
     bool isNumber() const noexcept { return hasValue() && kind() == Kind::Number; }
