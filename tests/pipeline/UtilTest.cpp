@@ -49,27 +49,6 @@ TEST(Util, TimeConversionsWithTimebases)
     EXPECT_EQ(Util::nanosecondsFromMachTime(987654321), 987654321u);
 }
 
-TEST(Util, TimebaseIsReadOnceUnderConcurrentFirstUse)
-{
-    for (int round = 0; round < 50; ++round) {
-        std::atomic<int> reads{0};
-        TimebaseOnce timebase([&reads] {
-            reads.fetch_add(1);
-            return Timebase{125, 3};
-        });
-        std::uint64_t a = 0, b = 0;
-        std::thread first([&] { a = Util::machTimeFromNanoseconds(1000, timebase.get()); });
-        std::thread second([&] { b = Util::nanosecondsFromMachTime(3, timebase.get()); });
-        first.join();
-        second.join();
-        EXPECT_EQ(reads.load(), 1);
-        EXPECT_EQ(a, 24u);
-        EXPECT_EQ(b, 125u);
-        EXPECT_EQ(timebase.get().numer, 125u);
-        EXPECT_EQ(reads.load(), 1);
-    }
-}
-
 TEST(Util, HexTextRoundTripsAndReadsLikeStreamExtraction)
 {
     EXPECT_EQ(Util::hexStringFromBytes({0x00, 0x0A, 0xFF}), "00 0a ff ");

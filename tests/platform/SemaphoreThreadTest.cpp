@@ -31,26 +31,6 @@ TEST(SemaphoreTest, CountsSignalsAcrossThreads)
     EXPECT_FALSE(semaphore->waitFor(0ns));
 }
 
-TEST(ThreadTest, DetachedThreadRunsTheBodyUnderItsShortenedName)
-{
-    Semaphore done;
-    std::string seenName;
-    std::thread::id bodyThread;
-    const bool started = Thread::startDetached(
-        [&] {
-            char name[32] = {};
-            pthread_getname_np(pthread_self(), name, sizeof name);
-            seenName = name;
-            bodyThread = std::this_thread::get_id();
-            done.signal();
-        },
-        "velto.input-report-thread");
-    EXPECT_TRUE(started);
-    ASSERT_TRUE(done.waitFor(10s));
-    EXPECT_EQ(seenName, "velto.input-rep");
-    EXPECT_NE(bodyThread, std::this_thread::get_id());
-}
-
 TEST(ThreadTest, InjectedStartFailuresReportFalseAndLogWithoutRunningTheBody)
 {
     CaptureLogSink::Scope capture(LogLevel::Error);
@@ -71,16 +51,4 @@ TEST(ThreadTest, InjectedStartFailuresReportFalseAndLogWithoutRunningTheBody)
     Thread::failNextStarts(0);
     EXPECT_TRUE(Thread::startDetached(body)) << "0 ends a failure run";
     ASSERT_TRUE(ran.waitFor(10s));
-}
-
-TEST(ThreadTest, SchedulingReportsTheErrorNumber)
-{
-    std::thread([] {
-        // Without the privilege the call fails with EPERM; either way it
-        // reports through its result, never by throwing.
-        int result = Thread::setCurrentScheduling(SCHED_RR, 63);
-        EXPECT_TRUE(result == 0 || result == EPERM) << result;
-        EXPECT_EQ(Thread::setCurrentScheduling(SCHED_RR, 1000), EINVAL);
-        EXPECT_EQ(Thread::setCurrentScheduling(SCHED_OTHER, 0), 0);
-    }).join();
 }
