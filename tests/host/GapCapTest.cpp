@@ -38,19 +38,4 @@ TEST(GapCap, WaitsUpToTheLimitAreKeptAndLongerOnesCut)
     }
 }
 
-TEST(GapCap, TheFirstCutWaitIsToldOnceWithItsSize)
-{
-    std::vector<std::string> notes;
-    GapCap cap(1.0, [&](const std::string& text) { notes.push_back(text); });
-    cap(500'000);
-    EXPECT_TRUE(notes.empty()) << "nothing was cut yet";
-    cap(3'000'000);
-    cap(1'000'000'000'000'000);
-    cap(5'000'000);
-    ASSERT_EQ(notes.size(), 1u);
-    EXPECT_EQ(notes[0],
-              "a wait of 3 s between two reports is shortened to 1 s, as is every wait longer than that (--max-gap "
-              "SECONDS sets the limit)");
-}
-
 }  // namespace

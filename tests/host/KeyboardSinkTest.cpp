@@ -49,14 +49,3 @@ TEST(KeyboardSinkTest, EveryActionIsAFrameOfItsOwnAndAFailedWriteDoesNotStopTheR
     EXPECT_TRUE(idle.play({}));
     EXPECT_EQ(idle.text, "");
 }
-
-TEST(KeyboardSinkTest, TheDefaultMapPlayedThroughASinkForAHoldInTheMiddle)
-{
-    KeyMap map;
-    TextSink sink;
-    using VeltoHost::Gesture;
-    for (Gesture::Kind kind : {Gesture::Kind::MayBegin, Gesture::Kind::HoldStart, Gesture::Kind::HoldEnd}) {
-        sink.play(map.handle({kind, Gesture::Region::Middle}));
-    }
-    EXPECT_EQ(sink.text, "+KEY_VOICECOMMAND | -KEY_VOICECOMMAND | ");
-}

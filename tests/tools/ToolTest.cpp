@@ -125,33 +125,6 @@ TEST(Tool, ScriptErrorsNameTheLineAndTheProblem)
     EXPECT_EQ(GestureScript::parse("idle 1.5s; idle 20ms")[0].durationMs, 1500u);
 }
 
-TEST(Tool, HostWithTheSimulatedDeviceGivesTheSameGesturesAsReplay)
-{
-    TempDir dir;
-    const std::string demo = std::string(VELTO_EXAMPLES_DIR) + "/demo.json";
-    const fs::path saved = dir.file("saved.json");
-    ToolRun host = runTool({"host", "--device", "sim:" + demo, "--speed", "0", "--jsonl", "--set",
-                            "Pipeline.Algs.HoldTimeoutMilliseconds=500", "--get", "Pipeline.DebugInfo",
-                            "--save-recording", saved.string()});
-    ASSERT_EQ(host.status, 0) << host.err;
-    ToolRun replay = runTool({"replay", demo, "--jsonl"});
-    ASSERT_EQ(replay.status, 0) << replay.err;
-
-    const auto hostEvents = eventsOf(host.out);
-    EXPECT_EQ(hostEvents, eventsOf(replay.out));
-    EXPECT_GE(hostEvents.size(), 10u);
-    EXPECT_NE(host.out.find(R"({"key":"Pipeline.DebugInfo","value":{"ResetCount":1,"DisjointImageCount":0}})"),
-              std::string::npos);
-
-    // The plug-in's own recording holds the setting (without its domain) and
-    // every report, and replays to the same gestures once more.
-    const std::string recording = readFile(saved);
-    EXPECT_NE(recording.find("\"Key\": \"Algs.HoldTimeoutMilliseconds\""), std::string::npos);
-    ToolRun again = runTool({"replay", saved.string(), "--jsonl"});
-    ASSERT_EQ(again.status, 0) << again.err;
-    EXPECT_EQ(eventsOf(again.out), hostEvents);
-}
-
 TEST(Tool, HostReportsWhatItCannotStart)
 {
     const std::string taps = std::string(VELTO_EXAMPLES_DIR) + "/taps.json";
