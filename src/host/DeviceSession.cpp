@@ -57,8 +57,12 @@ void DeviceSession::playInBackground(VeltoTouch::PipelineRecording recording, Si
                                      double speed)
 {
     if (_player.joinable()) throw std::logic_error("a device session plays one recording");
-    _player = std::thread([this, recording = std::move(recording), device = std::move(device), speed]() mutable {
-        play(std::move(recording), std::move(device), speed);
+    _player = std::thread([this, recording = std::move(recording), device = std::move(device), speed] {
+        play(recording, device, speed);
+        if (_stopPlaying) return;
+        std::lock_guard guard(_playedLock);
+        _played = true;
+        _playedChanged.notify_all();
     });
 }
 
@@ -68,7 +72,8 @@ bool DeviceSession::waitUntilPlayed(std::chrono::nanoseconds timeout)
     return _playedChanged.wait_for(guard, timeout, [this] { return _played; });
 }
 
-void DeviceSession::play(VeltoTouch::PipelineRecording recording, SimulatedHostDevice::Ref device, double speed)
+std::uint64_t DeviceSession::play(const VeltoTouch::PipelineRecording& recording,
+                                  const SimulatedHostDevice::Ref& device, double speed)
 {
     SimulatedDevicePlayer player(
         device,
@@ -77,12 +82,10 @@ void DeviceSession::play(VeltoTouch::PipelineRecording recording, SimulatedHostD
         },
         [this] { return _stopPlaying.load(); }, {speed, kMaxQueuedReports});
     for (const VeltoTouch::PipelineRecording::Frame& frame : recording.frames()) {
-        if (!player.play(frame)) return;
+        if (!player.play(frame)) break;
     }
-    if (!player.waitUntilTaken()) return;
-    std::lock_guard guard(_playedLock);
-    _played = true;
-    _playedChanged.notify_all();
+    player.waitUntilTaken();
+    return player.reportsPushed();
 }
 
 void DeviceSession::onEvent(const HidEventRef& event)

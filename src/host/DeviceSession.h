@@ -55,6 +55,11 @@ public:
     void playInBackground(VeltoTouch::PipelineRecording recording, SimulatedHostDevice::Ref device, double speed);
     // True once the playback has handed every report to the plug-in.
     bool waitUntilPlayed(std::chrono::nanoseconds timeout);
+    // The same playback on the calling thread, returning once the plug-in has
+    // taken every report (or the session is being taken apart); the number
+    // of reports pushed.
+    std::uint64_t play(const VeltoTouch::PipelineRecording& recording, const SimulatedHostDevice::Ref& device,
+                       double speed);
 
     const std::string& name() const noexcept { return _name; }
     std::optional<BusService::DeviceId> busId() const noexcept
@@ -63,10 +68,10 @@ public:
         return id == kNoBusId ? std::nullopt : std::optional(id);
     }
     HostEventSystem& host() noexcept { return _host; }
+    HostDeviceControl& control() noexcept { return *_control; }
 
 private:
     void onEvent(const HidEventRef& event);
-    void play(VeltoTouch::PipelineRecording recording, SimulatedHostDevice::Ref device, double speed);
     void sendKeys(const KeyMap::Actions& actions);
     void takeApart() noexcept;
 

@@ -1,18 +1,17 @@
 #pragma once
 
 #include "host/BusService.h"
-#include "host/HostDeviceControl.h"
-#include "platform/HostEventSystem.h"
+#include "host/DeviceSession.h"
 #include "platform/SimulatedHostDevice.h"
 
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
-// One simulated device running the real plug-in module in a HostEventSystem,
-// served on a BusService with its events published as signals: the daemon's
-// wiring of one device, taken apart again in the daemon's order (events
-// stopped, object withdrawn, plug-in stopped).
+// One simulated device running the real plug-in module, served on a
+// BusService: the daemon's own DeviceSession, without key output, with
+// recordings played into it on the test's thread.
 class AttachedDevice {
 public:
     AttachedDevice(VeltoHost::BusService& bus, const std::string& name);
@@ -20,12 +19,11 @@ public:
     AttachedDevice(const AttachedDevice&) = delete;
     AttachedDevice& operator=(const AttachedDevice&) = delete;
 
-    // Withdraws the device from the bus (the destructor does it otherwise).
+    // Takes the device apart: its object leaves the bus (the destructor does it otherwise).
     void detach();
 
     const VeltoHost::SimulatedHostDevice::Ref& device() const { return _device; }
-    VeltoHost::HostEventSystem& host() { return _host; }
-    VeltoHost::HostDeviceControl& control() { return *_control; }
+    VeltoHost::HostDeviceControl& control() { return _session->control(); }
     VeltoHost::BusService::DeviceId id() const { return _id; }
     std::string path() const { return VeltoHost::BusService::devicePath(_id); }
 
@@ -35,13 +33,9 @@ public:
     std::uint64_t play(const std::string& recordingPath);
 
 private:
-    VeltoHost::BusService& _bus;
     VeltoHost::SimulatedHostDevice::Ref _device;
-    VeltoHost::HostEventSystem _host;
-    std::shared_ptr<VeltoHost::HostDeviceControl> _control;
+    std::optional<VeltoHost::DeviceSession> _session;
     VeltoHost::BusService::DeviceId _id = 0;
-    VeltoHost::HostEventSystem::SubscriptionId _subscription = 0;
-    bool _attached = false;
 };
 
 // The text of a file (empty when it cannot be read).
