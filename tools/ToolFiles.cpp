@@ -56,13 +56,7 @@ std::string describeUnreadable(const std::string& path, const std::string& text,
 std::string ToolFiles::read(const std::string& path)
 {
     if (isDirectory(path)) throw ToolError(path + ": is a directory");
-    errno = 0;
-    std::ifstream in(path, std::ios::binary);
-    if (!in) failWithErrno(path, "cannot open");
-    std::ostringstream text;
-    text << in.rdbuf();
-    if (in.bad()) failWithErrno(path, "read failed");
-    return text.str();
+    return *readText(path, [] { return false; });
 }
 
 void ToolFiles::write(const std::string& path, const std::string& text)
@@ -105,6 +99,13 @@ std::optional<VeltoTouch::PipelineRecording> ToolFiles::readRecordingUnlessStopp
     const std::string& path, const std::function<bool()>& stopRequested)
 {
     if (isDirectory(path)) throw ToolError(path + ": is a directory, " + std::string(kExpectedRecording));
+    std::optional<std::string> text = readText(path, stopRequested);
+    if (!text) return std::nullopt;
+    return recordingFromText(path, *text);
+}
+
+std::optional<std::string> ToolFiles::readText(const std::string& path, const std::function<bool()>& stopRequested)
+{
     const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
     if (fd < 0) {
         if (errno == EINTR && stopRequested()) return std::nullopt;
@@ -129,7 +130,7 @@ std::optional<VeltoTouch::PipelineRecording> ToolFiles::readRecordingUnlessStopp
         }
     }
     ::close(fd);
-    return recordingFromText(path, text);
+    return text;
 }
 
 VeltoTouch::PipelineRecording ToolFiles::recordingFromText(const std::string& path, const std::string& text)

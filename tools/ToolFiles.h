@@ -37,6 +37,9 @@ public:
         const std::string& path, const std::function<bool()>& stopRequested);
 
 private:
+    // The whole file in pieces, so that a stop request (or the signal behind
+    // it interrupting a blocked read) ends it; empty when stopped.
+    static std::optional<std::string> readText(const std::string& path, const std::function<bool()>& stopRequested);
     static VeltoTouch::PipelineRecording recordingFromText(const std::string& path, const std::string& text);
 };
 
