@@ -13,7 +13,7 @@
 // Reports are spaced so that every thread sleeps when the next one comes, as
 // with the real device's frame rate. Percentiles are counters in microseconds.
 #include "AttachedDevice.h"
-#include "BusClient.h"
+#include "host/ControlClient.h"
 #include "PrivateBus.h"
 
 #include "host/BusService.h"
@@ -65,7 +65,7 @@ struct Setup {
     PrivateBus bus;
     std::optional<BusService> service;
     std::optional<AttachedDevice> device;
-    std::optional<BusClient> client;
+    std::optional<ControlClient> client;
 
     bool start(benchmark::State& state)
     {
@@ -77,7 +77,7 @@ struct Setup {
         }
         service.emplace(BusConnection::Address::at(bus.address()));
         device.emplace(*service, "sim:bench");
-        client.emplace(bus.address());
+        client.emplace(BusConnection::Address::at(bus.address()));
         if (!client->connected() || !client->watchSignals()) {
             state.SkipWithError("the client could not watch the bus");
             return false;
@@ -147,7 +147,7 @@ void BM_GestureReportToSignal(benchmark::State& state)
                 return;
             }
             for (const auto& signal : setup.client->signalsNamed("Gesture")) {
-                const auto pushed = pushedAt.find(signal.frame);
+                const auto pushed = pushedAt.find(signal.event.frame);
                 if (pushed != pushedAt.end()) samples.push_back(signal.receivedTicks - pushed->second);
             }
             setup.client->clearSignals();

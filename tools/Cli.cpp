@@ -1,5 +1,7 @@
 #include "Cli.h"
 
+#include "CtlCommand.h"
+#include "DaemonCommand.h"
 #include "DumpCommand.h"
 #include "FiniteNumberCheck.h"
 #include "HostCommand.h"
@@ -73,7 +75,7 @@ std::string usageLine(const CLI::App& app, const CLI::ParseError& error, int arg
     std::string message = error.what();
     // CLI11 takes a word that is no command for a missing command.
     if (app.get_subcommands().empty() && argc > 1 && argv[1][0] != '-') {
-        message = std::string("no command \"") + argv[1] + "\" (replay, synth, dump, host, help)";
+        message = std::string("no command \"") + argv[1] + "\" (replay, synth, dump, host, daemon, ctl, help)";
     }
     std::replace(message.begin(), message.end(), '\n', ' ');
     std::string help = "veltotouch help";
@@ -153,6 +155,48 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     hostCommand->add_flag("--jsonl", host.jsonLines, "One JSON object per line");
     hostCommand->add_flag("--summary", host.summary, "Print the gesture counters at the end");
 
+    DaemonCommand::Options daemon;
+    auto* daemonCommand = app.add_subcommand("daemon", "Serve touch devices on D-Bus and turn their gestures into keys");
+    daemonCommand->add_option("--config", daemon.config, "TOML settings: devices to take, key map, log level")
+        ->check(CLI::ExistingFile);
+    daemonCommand->add_option("--bus", daemon.bus, "system, session or a D-Bus address")->capture_default_str();
+    daemonCommand->add_option("--device", daemon.devices, "sim:FILE (a recording played, then left attached) or /dev/hidrawN")
+        ->check(deviceCheck());
+    daemonCommand->add_option("--speed", daemon.speed, "Simulated devices: play S times faster than recorded (0: at once)")
+        ->capture_default_str()
+        ->check(speedCheck());
+    daemonCommand->add_flag("!--no-udev", daemon.udev, "Take no device by itself, only those given with --device");
+    daemonCommand->add_flag("!--no-keys", daemon.keys, "Make no virtual keyboard");
+    daemonCommand->add_option("--plugin", daemon.plugin,
+                              "Plug-in module to load (default: $VELTOTOUCH_PLUGIN, else the installed or built module)");
+
+    CtlCommand::Options ctl;
+    auto* ctlCommand = app.add_subcommand("ctl", "Ask the running daemon: devices, properties, gestures, recordings");
+    ctlCommand->add_option("--bus", ctl.bus, "system, session or a D-Bus address")->capture_default_str();
+    ctlCommand->fallthrough();
+    ctlCommand->require_subcommand(1);
+    const auto ctlAction = [&](const char* name, const char* description, CtlCommand::Action action) {
+        CLI::App* command = ctlCommand->add_subcommand(name, description);
+        command->callback([&ctl, action] { ctl.action = action; });
+        if (action != CtlCommand::Action::Devices) {
+            command->add_option("-d,--device", ctl.device, "N: device number (see 'ctl devices'); default the first");
+        }
+        return command;
+    };
+    ctlAction("devices", "List the attached devices: number and name", CtlCommand::Action::Devices);
+    ctlAction("get", "Print a property's value as JSON", CtlCommand::Action::Get)
+        ->add_option("KEY", ctl.key, "Property, e.g. Pipeline.Algs.EventStats")
+        ->required();
+    ctlAction("set", "Write a property", CtlCommand::Action::Set)
+        ->add_option("KEY=VALUE", ctl.assignment, "VALUE is JSON")
+        ->required()
+        ->check(argumentCheck("KEY=JSON", [](const std::string& argument) { StateArguments::split(argument); }));
+    ctlAction("events", "Print gestures as they happen, until interrupted", CtlCommand::Action::Events)
+        ->add_flag("--jsonl", ctl.jsonLines, "One JSON object per line");
+    ctlAction("save-recording", "Write a device's recording to a file", CtlCommand::Action::SaveRecording)
+        ->add_option("OUT", ctl.output, "File to write (as the daemon's user)")
+        ->required();
+
     std::string helpTopic;
     auto* helpCommand = app.add_subcommand("help", "Describe the commands, or one COMMAND and its options");
     helpCommand->add_option("COMMAND", helpTopic, "Command to describe");
@@ -183,7 +227,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             return command->get_name() == helpTopic && command != helpCommand;
         });
         if (commands.empty()) {
-            err << "veltotouch: help: no command \"" << helpTopic << "\" (replay, synth, dump, host)\n";
+            err << "veltotouch: help: no command \"" << helpTopic << "\" (replay, synth, dump, host, daemon, ctl)\n";
             return kUsageError;
         }
         out << commands.front()->help("veltotouch");
@@ -201,6 +245,10 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
         } else if (*hostCommand) {
             host.settings = splitAll(hostSets);
             return HostCommand::run(host, out, err);
+        } else if (*daemonCommand) {
+            return DaemonCommand::run(daemon);
+        } else if (*ctlCommand) {
+            return CtlCommand::run(ctl, out);
         }
     } catch (const std::exception& error) {
         err << "veltotouch: " << error.what() << '\n';

@@ -14,9 +14,14 @@ using VeltoHost::HidEvent;
 
 std::string EventFormatter::format(const HidEvent& event) const
 {
-    const VeltoHost::GestureFields fields = VeltoHost::GestureFields::of(event);
+    return format(VeltoHost::GestureFields::of(event));
+}
+
+std::string EventFormatter::format(const VeltoHost::GestureFields& fields, std::optional<unsigned> device) const
+{
     if (_jsonLines) {
         nlohmann::ordered_json line;
+        if (device) line["device"] = *device;
         line["gesture"] = fields.gesture;
         if (fields.isDeviceReset) {
             line["usagePage"] = fields.usagePage;
@@ -33,13 +38,14 @@ std::string EventFormatter::format(const HidEvent& event) const
     }
 
     const std::uint64_t elapsedNs = VeltoTouch::Util::nanosecondsFromMachTime(fields.timestamp - _originTicks);
-    char text[128];
+    char text[160];
+    const std::string source = device ? "device " + std::to_string(*device) + "  " : "";
     if (fields.isDeviceReset) {
-        std::snprintf(text, sizeof text, "%9.3fs  %-12s (usage page 0x%X, usage %u)", elapsedNs / 1e9,
-                      fields.gesture.c_str(), fields.usagePage, fields.usage);
+        std::snprintf(text, sizeof text, "%s%9.3fs  %-12s (usage page 0x%X, usage %u)", source.c_str(),
+                      elapsedNs / 1e9, fields.gesture.c_str(), fields.usagePage, fields.usage);
     } else {
-        std::snprintf(text, sizeof text, "%9.3fs  %-12s %-7s frame %lld", elapsedNs / 1e9, fields.gesture.c_str(),
-                      fields.region.c_str(), static_cast<long long>(fields.frame));
+        std::snprintf(text, sizeof text, "%s%9.3fs  %-12s %-7s frame %lld", source.c_str(), elapsedNs / 1e9,
+                      fields.gesture.c_str(), fields.region.c_str(), static_cast<long long>(fields.frame));
     }
     return text;
 }

@@ -1,9 +1,11 @@
 #pragma once
 
+#include "host/GestureFields.h"
 #include "platform/HidEvent.h"
 #include "platform/PropertyValue.h"
 
 #include <cstdint>
+#include <optional>
 #include <string>
 
 namespace VeltoTool {
@@ -24,6 +26,10 @@ public:
     void setOrigin(std::uint64_t ticks) noexcept { _originTicks = ticks; }
 
     std::string format(const VeltoHost::HidEvent& event) const;
+    // An event watched from elsewhere (the daemon's signals). With `device`,
+    // the line says which device sent it: "device 1  " before a readable
+    // line, a leading "device" member in a JSON one.
+    std::string format(const VeltoHost::GestureFields& fields, std::optional<unsigned> device = {}) const;
     // A state or property read: {"key":"Algs.EventStats","value":{...}} or "KEY = VALUE".
     std::string formatState(const std::string& key, const VeltoHost::PropertyValue& value) const;
 

@@ -50,7 +50,7 @@ int pollTimeout(sd_bus* bus)
                                                                                    : static_cast<int>(milliseconds);
 }
 
-sd_bus* open(const BusConnection::Address& address)
+sd_bus* openBus(const BusConnection::Address& address)
 {
     sd_bus* bus = nullptr;
     int result = 0;
@@ -90,12 +90,14 @@ std::string BusConnection::Address::description() const
     return "the bus";
 }
 
+sd_bus* BusConnection::connect(const Address& address) { return openBus(address); }
+
 BusConnection::BusConnection(const Address& address)
     : _description(address.description()), _wakeFd(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK))
 {
     if (_wakeFd < 0) throw std::runtime_error(std::string("cannot create an eventfd: ") + std::strerror(errno));
     try {
-        _bus = open(address);
+        _bus = openBus(address);
     } catch (...) {
         ::close(_wakeFd);
         throw;

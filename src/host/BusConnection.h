@@ -45,6 +45,9 @@ public:
 
     // Connects; raises std::runtime_error naming the bus when that fails.
     explicit BusConnection(const Address& address);
+    // A bare client connection for a caller that serves it on its own
+    // thread (ControlClient); raises like the constructor. The caller unrefs it.
+    static sd_bus* connect(const Address& address);
     // Stops the thread (running the jobs still queued), flushes what is
     // waiting to be sent and closes the connection.
     ~BusConnection();

@@ -56,6 +56,11 @@ Daemon::Daemon(Options options, std::unique_ptr<DeviceWatcher> watcher, DeviceOp
             session->playInBackground(std::move(recording), device, _options.speed);
         }
     }
+    for (const std::string& path : _options.devicePaths) {
+        DeviceWatcher::Device given;
+        given.path = path;
+        openAndAttach(given);
+    }
 }
 
 Daemon::~Daemon()
@@ -84,6 +89,11 @@ void Daemon::attachWatched(const DeviceWatcher::Device& device)
     const bool known = std::any_of(_sessions.begin(), _sessions.end(),
                                    [&](const auto& session) { return session.first == device.path; });
     if (known) return;  // reported by both the enumeration and the monitor
+    openAndAttach(device);
+}
+
+void Daemon::openAndAttach(const DeviceWatcher::Device& device)
+{
     HostDevice::Ref opened;
     try {
         opened = _open(device);

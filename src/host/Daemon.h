@@ -35,6 +35,7 @@ public:
     struct Options {
         BusConnection::Address bus = BusConnection::Address::system();
         std::vector<std::string> simulatedFiles;  // played as devices, then left attached
+        std::vector<std::string> devicePaths;     // hidraw nodes given by hand, whatever their ids
         double speed = 1.0;                       // of the simulated devices; 0 as fast as taken
         bool keys = true;
         std::string uinputPath = UinputKeyboard::kDefaultUinputPath;
@@ -45,7 +46,8 @@ public:
     using DeviceOpener = std::function<HostDevice::Ref(const DeviceWatcher::Device&)>;
 
     // Connects to the bus and takes the name, creates the keyboard (or says
-    // once why there is none) and attaches every simulated device. Raises
+    // once why there is none) and attaches every simulated device and every
+    // device given by path (one that fails to open is logged and skipped). Raises
     // std::runtime_error when the bus or a recording file cannot be had, and
     // the container reader's errors for a malformed recording: a service that
     // cannot be reached, or was given a bad file by hand, should not start.
@@ -62,6 +64,8 @@ private:
     // The new session, or null when the device would not start (logged).
     DeviceSession* attach(const std::string& name, HostDevice::Ref device);
     void attachWatched(const DeviceWatcher::Device& device);
+    // Opens and attaches; a device that will not open is logged and skipped.
+    void openAndAttach(const DeviceWatcher::Device& device);
     void detach(const std::string& name);
 
     const Log _log{"Daemon"};

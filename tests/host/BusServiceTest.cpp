@@ -1,5 +1,5 @@
 #include "AttachedDevice.h"
-#include "BusClient.h"
+#include "host/ControlClient.h"
 #include "PrivateBus.h"
 
 #include "host/BusService.h"
@@ -42,15 +42,7 @@ std::string describe(const GestureFields& fields)
            std::to_string(fields.y);
 }
 
-std::string describe(const BusClient::Signal& signal)
-{
-    if (signal.member == "DeviceReset") return "device-reset";
-    return signal.gesture + " " + signal.region + " frame " + std::to_string(signal.frame) + " phase " +
-           std::to_string(signal.phase) + " mask " + std::to_string(signal.eventMask) + " y " +
-           std::to_string(signal.y);
-}
-
-bool isEvent(const BusClient::Signal& signal) { return signal.member == "Gesture" || signal.member == "DeviceReset"; }
+bool isEvent(const ControlClient::Signal& signal) { return signal.member == "Gesture" || signal.member == "DeviceReset"; }
 
 // What `veltotouch replay` prints for a recording, as events.
 std::vector<std::string> replayedEvents(const std::string& path)
@@ -69,7 +61,7 @@ std::vector<std::string> replayedEvents(const std::string& path)
     return events;
 }
 
-std::uint64_t tapsCounted(BusClient& client, const std::string& path)
+std::uint64_t tapsCounted(ControlClient& client, const std::string& path)
 {
     const PropertyValue counters = VeltoTouch::JsonValue::parse(client.getProperty(path, kCounters).value);
     return counters.asDictionary().get("Dispatched").asDictionary().get("numTaps").toUInt64();
@@ -81,7 +73,7 @@ protected:
     {
         ASSERT_FALSE(_bus.address().empty()) << _bus.error();
         _service.emplace(BusConnection::Address::at(_bus.address()));
-        _client = std::make_unique<BusClient>(_bus.address());
+        _client = std::make_unique<ControlClient>(BusConnection::Address::at(_bus.address()));
         ASSERT_TRUE(_client->connected()) << _client->connectError();
         ASSERT_TRUE(_client->watchSignals());
     }
@@ -100,7 +92,7 @@ protected:
 
     PrivateBus _bus;
     std::optional<BusService> _service;
-    std::unique_ptr<BusClient> _client;
+    std::unique_ptr<ControlClient> _client;
     std::vector<std::unique_ptr<AttachedDevice>> _devices;
 };
 
@@ -158,9 +150,9 @@ TEST_F(BusServiceTest, SettingsRoundTripAsJsonWhileReportsFlow)
         {"Pipeline.Algs.VirtualNormalizationFactors.7", "0.5", "0.5"},
     };
     for (const Case& c : cases) {
-        const BusClient::Reply written = _client->setProperty(device.path(), c.key, c.written);
+        const ControlClient::Reply written = _client->setProperty(device.path(), c.key, c.written);
         EXPECT_EQ(written.error, "") << c.key << ": " << written.message;
-        const BusClient::Reply read = _client->getProperty(device.path(), c.key);
+        const ControlClient::Reply read = _client->getProperty(device.path(), c.key);
         EXPECT_EQ(read.error, "") << c.key << ": " << read.message;
         EXPECT_EQ(read.value, c.readBack) << c.key;
     }
@@ -235,7 +227,7 @@ TEST_F(BusServiceTest, MalformedRequestsAreRefusedWhileTheDeviceKeepsRecognising
     device.device()->refusePropertyWrites(true);
     const std::string before = _client->getProperty(path, "Pipeline.Algs.ActivationThreshold").value;
     for (const Case& c : cases) {
-        const BusClient::Reply reply = _client->call(c.path, BusService::kDeviceInterface, c.member, c.arguments);
+        const ControlClient::Reply reply = _client->call(c.path, BusService::kDeviceInterface, c.member, c.arguments);
         EXPECT_EQ(reply.error, c.error) << c.what << " (" << reply.message << ")";
         EXPECT_FALSE(reply.message.empty()) << c.what;
     }
@@ -271,9 +263,9 @@ TEST_P(GestureSignalTest, SignalsArriveInOrderAndEqualTheReplay)
     for (const auto& signal : _client->signals()) {
         if (!isEvent(signal)) continue;
         EXPECT_EQ(signal.path, device.path());
-        EXPECT_GE(signal.timestamp, previousTimestamp) << describe(signal);
-        previousTimestamp = signal.timestamp;
-        received.push_back(describe(signal));
+        EXPECT_GE(signal.event.timestamp, previousTimestamp) << describe(signal.event);
+        previousTimestamp = signal.event.timestamp;
+        received.push_back(describe(signal.event));
     }
     EXPECT_EQ(received, expected);
 }
@@ -290,7 +282,7 @@ TEST_F(BusServiceTest, SavedRecordingIsTheDevicesRecordingAndPrivate)
     const std::string directory = PrivateBus().directory();  // a fresh name, removed again
     std::filesystem::create_directories(directory);
     const std::string file = directory + "/session.json";
-    const BusClient::Reply saved = _client->saveRecording(device.path(), file);
+    const ControlClient::Reply saved = _client->saveRecording(device.path(), file);
     ASSERT_EQ(saved.error, "") << saved.message;
 
     const std::string text = readFile(file);

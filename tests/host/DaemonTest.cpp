@@ -1,6 +1,6 @@
 #include "host/Daemon.h"
 
-#include "BusClient.h"
+#include "host/ControlClient.h"
 #include "PrivateBus.h"
 
 #include "platform/RunLoop.h"
@@ -67,7 +67,7 @@ TEST(DaemonTest, ServesSimulatedAndHotPluggedDevicesAndTakesOnlyTheConfiguredOne
     auto watcher = std::make_unique<TestWatcher>();
     TestWatcher& plugs = *watcher;
     std::atomic<int> opened{0};
-    BusClient client(bus.address());
+    ControlClient client(BusConnection::Address::at(bus.address()));
     ASSERT_TRUE(client.connected()) << client.connectError();
     ASSERT_TRUE(client.watchSignals());
 

@@ -1,7 +1,7 @@
 #include "host/DeviceSession.h"
 
 #include "AttachedDevice.h"
-#include "BusClient.h"
+#include "host/ControlClient.h"
 #include "PrivateBus.h"
 
 #include <gtest/gtest.h>
@@ -50,7 +50,7 @@ TEST(DeviceSessionTest, GesturesBecomeSignalsAndKeysAndAHeldKeyIsReleasedWhenThe
     PrivateBus bus;
     ASSERT_FALSE(bus.address().empty()) << bus.error();
     BusService service(BusConnection::Address::at(bus.address()));
-    BusClient client(bus.address());
+    ControlClient client(BusConnection::Address::at(bus.address()));
     ASSERT_TRUE(client.connected()) << client.connectError();
     ASSERT_TRUE(client.watchSignals());
     RecordingKeyboard keyboard;
@@ -104,7 +104,7 @@ TEST(DeviceSessionTest, ADeviceThatCannotStartLeavesNoObjectOnTheBus)
     device->failOpen(true);
     EXPECT_THROW(DeviceSession("sim:x", device, VELTO_SERVICE_MODULE_PATH, {&service, nullptr, nullptr, {}}),
                  std::runtime_error);
-    BusClient client(bus.address());
-    std::string error;
-    EXPECT_TRUE(client.listDevices(&error).empty()) << error;
+    ControlClient client(BusConnection::Address::at(bus.address()));
+    ControlClient::Reply listed;
+    EXPECT_TRUE(client.listDevices(&listed).empty()) << listed.message;
 }

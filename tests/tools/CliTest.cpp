@@ -35,7 +35,7 @@ TEST(Cli, UsageErrorsExitWithTwoAndOneLineThatNamesTheProblem)
     };
     const Case cases[] = {
         {{}, "A subcommand is required"},
-        {{"frobnicate"}, "no command \"frobnicate\" (replay, synth, dump, host, help)"},
+        {{"frobnicate"}, "no command \"frobnicate\" (replay, synth, dump, host, daemon, ctl, help)"},
         {{"replay"}, "FILE is required"},
         {{"synth", "tap top"}, "--output is required"},
         {{"replay", kTaps, "--speed", "nan"}, "--speed: expected a finite number, got nan"},
@@ -55,6 +55,10 @@ TEST(Cli, UsageErrorsExitWithTwoAndOneLineThatNamesTheProblem)
         {{"host", "--device", "sim:" + kTaps, "--set", "Pipeline.NoEquals"}, "--set: expected KEY=VALUE"},
         {{"host", "--device", "sim:" + kTaps, "--speed", "nan"}, "--speed: expected a finite number, got nan"},
         {{"host", "--device", "sim:" + kTaps, "--speed", "1e-9"}, "--speed: must be 0 or at least 0.001"},
+        {{"daemon", "--device", "sim:", "--no-udev"}, "sim: needs a recording after the colon"},
+        {{"daemon", "--config", "/no/such.toml"}, "--config: File does not exist: /no/such.toml"},
+        {{"ctl", "set", "NoEquals"}, "expected KEY=VALUE, got \"NoEquals\""},
+        {{"ctl", "get", "-d", "first", "Pipeline.Algs.EventStats"}, "-d"},
         {{"help", "frobnicate"}, "help: no command \"frobnicate\""},
     };
     for (const Case& c : cases) {

@@ -1,22 +1,26 @@
-#include "BusClient.h"
+#include "host/ControlClient.h"
 
 #include "host/BusService.h"
+#include "host/Gesture.h"
+#include "pipeline/Pipeline.h"
 #include "platform/MonotonicClock.h"
 
 #include <systemd/sd-bus.h>
 
+#include <cerrno>
 #include <cstring>
+#include <exception>
 
-using VeltoHost::BusService;
+namespace VeltoHost {
 
 namespace {
 
 // A reply for a whole recording can take a while on a loaded machine.
 constexpr std::uint64_t kCallTimeoutUs = 30'000'000;
 
-BusClient::Reply replyOf(int result, sd_bus_error& error)
+ControlClient::Reply replyOf(int result, sd_bus_error& error)
 {
-    BusClient::Reply reply;
+    ControlClient::Reply reply;
     if (result < 0) {
         reply.error = sd_bus_error_is_set(&error) ? error.name : "errno";
         reply.message = error.message ? error.message : std::strerror(-result);
@@ -26,29 +30,24 @@ BusClient::Reply replyOf(int result, sd_bus_error& error)
 
 }  // namespace
 
-BusClient::BusClient(const std::string& address)
+ControlClient::ControlClient(const BusConnection::Address& address)
 {
-    sd_bus* bus = nullptr;
-    int result = sd_bus_new(&bus);
-    if (result >= 0) result = sd_bus_set_address(bus, address.c_str());
-    if (result >= 0) result = sd_bus_set_bus_client(bus, 1);
-    if (result >= 0) result = sd_bus_start(bus);
-    if (result < 0) {
-        _connectError = std::string("cannot connect to ") + address + ": " + std::strerror(-result);
-        sd_bus_unref(bus);
+    try {
+        _bus = BusConnection::connect(address);
+    } catch (const std::exception& error) {
+        _connectError = error.what();
         return;
     }
-    sd_bus_set_method_call_timeout(bus, kCallTimeoutUs);
-    _bus = bus;
+    sd_bus_set_method_call_timeout(_bus, kCallTimeoutUs);
 }
 
-BusClient::~BusClient()
+ControlClient::~ControlClient()
 {
     sd_bus_slot_unref(_match);
     sd_bus_flush_close_unref(_bus);
 }
 
-BusClient::Reply BusClient::call(const std::string& path, const std::string& interface, const std::string& member,
+ControlClient::Reply ControlClient::call(const std::string& path, const std::string& interface, const std::string& member,
                                  const std::vector<std::string>& arguments)
 {
     sd_bus_message* message = nullptr;
@@ -74,22 +73,22 @@ BusClient::Reply BusClient::call(const std::string& path, const std::string& int
     return reply;
 }
 
-BusClient::Reply BusClient::getProperty(const std::string& path, const std::string& key)
+ControlClient::Reply ControlClient::getProperty(const std::string& path, const std::string& key)
 {
     return call(path, BusService::kDeviceInterface, "GetProperty", {key});
 }
 
-BusClient::Reply BusClient::setProperty(const std::string& path, const std::string& key, const std::string& json)
+ControlClient::Reply ControlClient::setProperty(const std::string& path, const std::string& key, const std::string& json)
 {
     return call(path, BusService::kDeviceInterface, "SetProperty", {key, json});
 }
 
-BusClient::Reply BusClient::saveRecording(const std::string& path, const std::string& file)
+ControlClient::Reply ControlClient::saveRecording(const std::string& path, const std::string& file)
 {
     return call(path, BusService::kDeviceInterface, "SaveRecording", {file});
 }
 
-std::vector<std::string> BusClient::listDevices(std::string* errorName)
+std::vector<std::string> ControlClient::listDevices(Reply* failure)
 {
     sd_bus_message* answer = nullptr;
     sd_bus_error error{};  // all null: no error set
@@ -97,7 +96,7 @@ std::vector<std::string> BusClient::listDevices(std::string* errorName)
                                           BusService::kManagerInterface, "ListDevices", &error, &answer, "");
     std::vector<std::string> paths;
     if (result < 0) {
-        if (errorName) *errorName = replyOf(result, error).error;
+        if (failure) *failure = replyOf(result, error);
     } else if (sd_bus_message_enter_container(answer, 'a', "o") > 0) {
         const char* path = nullptr;
         while (sd_bus_message_read_basic(answer, 'o', &path) > 0) paths.emplace_back(path);
@@ -109,7 +108,7 @@ std::vector<std::string> BusClient::listDevices(std::string* errorName)
     return paths;
 }
 
-BusClient::Reply BusClient::name(const std::string& path)
+ControlClient::Reply ControlClient::name(const std::string& path)
 {
     sd_bus_error error{};  // all null: no error set
     char* text = nullptr;
@@ -123,38 +122,45 @@ BusClient::Reply BusClient::name(const std::string& path)
     return reply;
 }
 
-std::string BusClient::requestServiceName()
-{
-    const int result = sd_bus_request_name(_bus, BusService::kBusName, 0);
-    if (result >= 0) return {};
-    return result == -EACCES ? "org.freedesktop.DBus.Error.AccessDenied" : std::strerror(-result);
-}
-
-bool BusClient::watchSignals()
+bool ControlClient::watchSignals()
 {
     const std::string rule = std::string("type='signal',path_namespace='") + BusService::kManagerPath + "'";
-    return sd_bus_add_match(_bus, &_match, rule.c_str(), &BusClient::onSignal, this) >= 0;
+    return sd_bus_add_match(_bus, &_match, rule.c_str(), &ControlClient::onSignal, this) >= 0;
 }
 
-int BusClient::onSignal(sd_bus_message* message, void* userdata, sd_bus_error*)
+int ControlClient::onSignal(sd_bus_message* message, void* userdata, sd_bus_error*)
 {
-    auto* self = static_cast<BusClient*>(userdata);
+    auto* self = static_cast<ControlClient*>(userdata);
     Signal signal;
-    signal.receivedTicks = VeltoHost::MonotonicClock::now();
+    signal.receivedTicks = MonotonicClock::now();
     signal.path = sd_bus_message_get_path(message) ? sd_bus_message_get_path(message) : "";
     signal.member = sd_bus_message_get_member(message) ? sd_bus_message_get_member(message) : "";
+    GestureFields& event = signal.event;
     if (signal.member == "Gesture") {
         const char* gesture = nullptr;
         const char* region = nullptr;
-        if (sd_bus_message_read(message, "ssuuuit", &gesture, &region, &signal.frame, &signal.phase,
-                                &signal.eventMask, &signal.y, &signal.timestamp) < 0) {
+        std::uint32_t frame = 0;
+        std::int32_t y = 0;
+        if (sd_bus_message_read(message, "ssuuuit", &gesture, &region, &frame, &event.phase, &event.eventMask, &y,
+                                &event.timestamp) < 0) {
             signal.member += " (unreadable)";
         } else {
-            signal.gesture = gesture;
-            signal.region = region;
+            event.gesture = gesture;
+            event.region = region;
+            event.frame = frame;
+            event.y = y;
         }
     } else if (signal.member == "DeviceReset") {
-        if (sd_bus_message_read(message, "t", &signal.timestamp) < 0) signal.member += " (unreadable)";
+        // The signal carries only the time: the service sends it for the one
+        // vendor-defined event the plug-in makes, whose usages are fixed.
+        if (sd_bus_message_read(message, "t", &event.timestamp) < 0) {
+            signal.member += " (unreadable)";
+        } else {
+            event.gesture = Gesture::name(Gesture::Kind::DeviceReset);
+            event.isDeviceReset = true;
+            event.usagePage = VeltoTouch::Pipeline::kResetEventUsagePage;
+            event.usage = VeltoTouch::Pipeline::kResetEventUsage;
+        }
     } else if (signal.member == "DeviceAdded" || signal.member == "DeviceRemoved") {
         const char* object = nullptr;
         if (sd_bus_message_read(message, "o", &object) < 0) {
@@ -167,13 +173,15 @@ int BusClient::onSignal(sd_bus_message* message, void* userdata, sd_bus_error*)
     return 0;
 }
 
-void BusClient::drain()
+void ControlClient::drain()
 {
-    while (_bus && sd_bus_process(_bus, nullptr) > 0) {
+    int processed = 0;
+    while (_bus && (processed = sd_bus_process(_bus, nullptr)) > 0) {
     }
+    if (processed < 0) _broken = true;
 }
 
-bool BusClient::waitUntil(const std::function<bool()>& done, std::chrono::milliseconds limit)
+bool ControlClient::waitUntil(const std::function<bool()>& done, std::chrono::milliseconds limit)
 {
     const auto deadline = std::chrono::steady_clock::now() + limit;
     for (;;) {
@@ -182,11 +190,16 @@ bool BusClient::waitUntil(const std::function<bool()>& done, std::chrono::millis
         const auto now = std::chrono::steady_clock::now();
         if (now >= deadline) return false;
         const auto left = std::chrono::duration_cast<std::chrono::microseconds>(deadline - now);
-        if (sd_bus_wait(_bus, static_cast<std::uint64_t>(left.count())) < 0) return false;
+        const int waited = sd_bus_wait(_bus, static_cast<std::uint64_t>(left.count()));
+        if (waited == -EINTR) return false;
+        if (waited < 0) {
+            _broken = true;
+            return false;
+        }
     }
 }
 
-std::vector<BusClient::Signal> BusClient::signalsNamed(const std::string& member) const
+std::vector<ControlClient::Signal> ControlClient::signalsNamed(const std::string& member) const
 {
     std::vector<Signal> found;
     for (const Signal& signal : _signals) {
@@ -194,3 +207,5 @@ std::vector<BusClient::Signal> BusClient::signalsNamed(const std::string& member
     }
     return found;
 }
+
+}  // namespace VeltoHost

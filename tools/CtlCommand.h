@@ -1,0 +1,32 @@
+#pragma once
+
+#include <optional>
+#include <ostream>
+#include <string>
+
+namespace VeltoTool {
+
+// `veltotouch ctl`: the daemon's control interface for people who do not
+// speak D-Bus. Lists the devices, reads and writes their properties (values
+// as JSON text, as the daemon takes them), saves a device's recording, and
+// prints gestures as they happen in the same lines as `host` and `replay`.
+class CtlCommand {
+public:
+    enum class Action { Devices, Get, Set, Events, SaveRecording };
+
+    struct Options {
+        std::string bus = "system";      // "system", "session" or a bus address
+        Action action = Action::Devices;
+        std::optional<unsigned> device;  // empty: the first attached (Events: all)
+        std::string key;                 // Get
+        std::string assignment;          // Set: KEY=VALUE
+        std::string output;              // SaveRecording
+        bool jsonLines = false;          // Events
+    };
+
+    // Returns the exit status; throws ToolError when the daemon cannot be
+    // reached or refuses a request.
+    static int run(const Options& options, std::ostream& out);
+};
+
+}  // namespace VeltoTool

@@ -1,0 +1,29 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+namespace VeltoTool {
+
+// `veltotouch daemon`: the system service. Serves every configured device
+// (found by udev) and every device given by hand on the bus, turns gestures
+// into key presses, and runs until SIGINT or SIGTERM, then takes the devices
+// apart in the order they came.
+class DaemonCommand {
+public:
+    struct Options {
+        std::string config;                // TOML file; empty: built-in defaults
+        std::string bus = "system";        // "system", "session" or a bus address
+        std::vector<std::string> devices;  // sim:FILE or /dev/hidrawN
+        double speed = 1.0;
+        bool udev = true;
+        bool keys = true;
+        std::string plugin;  // empty: look for it (PluginLocator)
+    };
+
+    // Returns the exit status; throws ToolError (or the readers' errors) for
+    // what keeps the service from starting.
+    static int run(const Options& options);
+};
+
+}  // namespace VeltoTool
