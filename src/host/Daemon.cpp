@@ -12,6 +12,7 @@
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
+#include <thread>
 #include <utility>
 
 namespace VeltoHost {
@@ -78,7 +79,13 @@ void Daemon::run(const std::function<bool()>& stopRequested)
     }
     sd_notify(0, "READY=1");
     _log.log("serving %ju devices", static_cast<std::uint64_t>(_sessions.size()));
-    while (!stopRequested()) RunLoop::run(kRunLoopMode, kStopPollInterval, false);
+    while (!stopRequested()) {
+        // Without a watcher the mode may have nothing to wait on, and the
+        // loop returns at once: then wait here instead of spinning.
+        if (RunLoop::run(kRunLoopMode, kStopPollInterval, false) == RunLoop::RunResult::Finished) {
+            std::this_thread::sleep_for(kStopPollInterval);
+        }
+    }
     sd_notify(0, "STOPPING=1");
     if (_watcher) _watcher->stop();
 }

@@ -116,6 +116,7 @@ public:
     ToolProcess& operator=(const ToolProcess&) = delete;
 
     bool started() const { return _pid > 0; }
+    pid_t pid() const { return _pid; }
 
     // The next line of standard output, or nothing when the output ends or
     // no line comes before the deadline.
