@@ -8,6 +8,7 @@
 #include "platform/MonotonicClock.h"
 #include "recording/PipelineRecording.h"
 
+#include <functional>
 #include <memory>
 #include <optional>
 
@@ -35,8 +36,6 @@ void applySettings(Pipeline& pipeline, const ReplayCommand::Options& options, st
 
 void ReplayCommand::run(const Options& options, std::ostream& out, std::ostream& err)
 {
-    PipelineRecording recording = ToolFiles::readRecording(options.file);
-
     auto pipeline = std::make_shared<Pipeline>();
     applySettings(*pipeline, options, err);
 
@@ -58,22 +57,29 @@ void ReplayCommand::run(const Options& options, std::ostream& out, std::ostream&
         dumps.emplace(out, options.jsonLines ? AlgsDumpSink::Format::JsonLines : AlgsDumpSink::Format::Text);
     }
 
-    recording.pipeline = pipeline;
     VeltoHost::GapCap gapCap(options.maxGapSeconds, [&](const std::string& note) { err << "veltotouch: note: " << note << '\n'; });
+    std::function<void(std::uint64_t)> sleep;
     if (options.speed > 0) {
         // Whatever was printed is let out before each wait: into a pipe the
         // output is block-buffered, and a paced run stopped with Ctrl-C would
         // otherwise end with nothing shown.
-        recording.sleepMicroseconds = [&](std::uint64_t microseconds) {
+        sleep = [&](std::uint64_t microseconds) {
             out.flush();
             VeltoHost::MonotonicClock::sleepMicroseconds(gapCap(microseconds));
         };
-    } else {
-        recording.sleepMicroseconds = [](std::uint64_t) {};
     }
     const float speed = options.speed > 0 ? options.speed : 1.0f;
-    recording.playReset();
-    while (recording.playCanContinue()) recording.playNextFrame(speed);
+
+    // Played as it is read, so that a recording of any length fits in memory.
+    PipelineRecording::PlayClock clock;
+    std::optional<std::uint64_t> firstTimestampNs;
+    ToolFiles::streamRecording(options.file, [&](PipelineRecording::Frame&& frame) {
+        if (!firstTimestampNs) {
+            firstTimestampNs = frame.timestampNs;
+            clock.reset();
+        }
+        PipelineRecording::playFrame(frame, clock, *firstTimestampNs, speed, sleep, pipeline.get());
+    });
     dumps.reset();
 
     for (const std::string& key : options.reads) {

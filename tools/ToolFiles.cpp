@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdio>
 #include <cstring>
 #include <filesystem>
 #include <sstream>
@@ -20,6 +21,9 @@ namespace {
 constexpr std::string_view kExpectedRecording = "expected a recording (JSON container)";
 constexpr std::string_view kInvalidContainer = "invalid container";
 constexpr std::size_t kReadChunk = 1 << 20;
+// A streamed file that is not a container is read again, whole, to say what
+// it is instead, unless it is larger than this.
+constexpr std::uintmax_t kLargestDescribed = 64 << 20;
 
 [[noreturn]] void failWithErrno(const std::string& path, const char* fallback)
 {
@@ -140,6 +144,30 @@ VeltoTouch::PipelineRecording ToolFiles::recordingFromText(const std::string& pa
     } catch (const std::exception& error) {
         throw ToolError(describeUnreadable(path, text, error.what()));
     }
+}
+
+void ToolFiles::streamRecording(const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame)
+{
+    if (isDirectory(path)) throw ToolError(path + ": is a directory, " + std::string(kExpectedRecording));
+    errno = 0;
+    std::FILE* file = std::fopen(path.c_str(), "rbe");
+    if (!file) failWithErrno(path, "cannot open");
+    try {
+        VeltoTouch::ContainerStream::read(file, onFrame);
+    } catch (const ToolError&) {
+        std::fclose(file);
+        throw;
+    } catch (const std::exception& error) {
+        std::fclose(file);
+        const std::string message = error.what();
+        std::error_code sizeError;
+        const std::uintmax_t size = std::filesystem::file_size(path, sizeError);
+        if (!std::string_view(message).ends_with(kInvalidContainer) || sizeError || size > kLargestDescribed) {
+            throw ToolError(path + ": " + message);
+        }
+        throw ToolError(describeUnreadable(path, read(path), message));
+    }
+    std::fclose(file);
 }
 
 }  // namespace VeltoTool

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "recording/ContainerStream.h"
 #include "recording/PipelineRecording.h"
 
 #include <fstream>
@@ -35,6 +36,12 @@ public:
     // interrupts it). Empty when stopped.
     static std::optional<VeltoTouch::PipelineRecording> readRecordingUnlessStopped(
         const std::string& path, const std::function<bool()>& stopRequested);
+
+    // The recording at `path` read as it arrives, each frame handed over as
+    // soon as it is complete (ContainerStream), so that its length does not
+    // matter. Failures as readRecording's, raised where they are reached: the
+    // frames before a fault have been handed over.
+    static void streamRecording(const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame);
 
 private:
     // The whole file in pieces, so that a stop request (or the signal behind

@@ -1,5 +1,7 @@
 #include "recording/JsonValue.h"
 
+#include "recording/PropertyValueBuilder.h"
+
 #include "pipeline/Util.h"
 #include "platform/PropertyDictionary.h"
 
@@ -16,97 +18,6 @@ namespace VeltoTouch {
 using VeltoHost::PropertyDictionary;
 
 namespace {
-
-// Builds a PropertyValue tree straight from nlohmann's SAX events, so that a
-// container is parsed into one tree only (not an intermediate JSON tree that
-// is then converted).
-class PropertyValueBuilder {
-public:
-    explicit PropertyValueBuilder(JsonValue::TopLevel topLevel) : _topLevel(topLevel) {}
-
-    PropertyValue takeResult() { return std::move(_result); }
-
-    bool null() { return addScalar(PropertyValue::null()); }
-    bool boolean(bool value) { return addScalar(PropertyValue::boolean(value)); }
-    // The lexer reports only negative integers here (and "-0").
-    bool number_integer(nlohmann::json::number_integer_t value)
-    {
-        return addScalar(value < 0 ? PropertyValue::int64(value)
-                                   : PropertyValue::uint64(static_cast<std::uint64_t>(value)));
-    }
-    bool number_unsigned(nlohmann::json::number_unsigned_t value) { return addScalar(PropertyValue::uint64(value)); }
-    bool number_float(nlohmann::json::number_float_t value, const std::string&)
-    {
-        return addScalar(PropertyValue::float64(value));
-    }
-    bool string(std::string& value) { return addScalar(PropertyValue::string(std::move(value))); }
-    // Only binary formats produce these; JSON text never does.
-    bool binary(nlohmann::json::binary_t&) { return false; }
-
-    bool start_object(std::size_t) { return open(true); }
-    bool key(std::string& key)
-    {
-        _levels.back().key = std::move(key);
-        return true;
-    }
-    bool end_object()
-    {
-        Level level = std::move(_levels.back());
-        _levels.pop_back();
-        return add(PropertyValue::dictionary(std::move(level.entries)));
-    }
-
-    bool start_array(std::size_t) { return open(false); }
-    bool end_array()
-    {
-        Level level = std::move(_levels.back());
-        _levels.pop_back();
-        return add(PropertyValue::array(std::move(level.items)));
-    }
-
-    bool parse_error(std::size_t, const std::string&, const nlohmann::detail::exception&) { return false; }
-
-private:
-    struct Level {
-        bool isObject = false;
-        PropertyValue::Array items;
-        PropertyDictionary entries;
-        std::string key;
-    };
-
-    bool open(bool isObject)
-    {
-        if (_levels.size() >= JsonValue::kMaxNestingDepth) return false;
-        _levels.push_back(Level{isObject, {}, {}, {}});
-        return true;
-    }
-
-    bool addScalar(PropertyValue value)
-    {
-        if (_levels.empty() && _topLevel == JsonValue::TopLevel::ObjectOrArray) return false;
-        return add(std::move(value));
-    }
-
-    bool add(PropertyValue value)
-    {
-        if (_levels.empty()) {
-            _result = std::move(value);
-            return true;
-        }
-        Level& level = _levels.back();
-        // A repeated key keeps its first position and takes the later value.
-        if (level.isObject) {
-            level.entries.set(std::move(level.key), std::move(value));
-        } else {
-            level.items.push_back(std::move(value));
-        }
-        return true;
-    }
-
-    JsonValue::TopLevel _topLevel;
-    std::vector<Level> _levels;
-    PropertyValue _result;
-};
 
 nlohmann::ordered_json numberToJson(const PropertyValue& value)
 {
@@ -141,7 +52,7 @@ nlohmann::ordered_json numberToJson(const PropertyValue& value)
 
 PropertyValue JsonValue::parse(std::string_view text, TopLevel topLevel)
 {
-    PropertyValueBuilder builder(topLevel);
+    PropertyValueBuilder builder(topLevel == TopLevel::AnyValue);
     if (!nlohmann::json::sax_parse(text.begin(), text.end(), &builder, nlohmann::json::input_format_t::json,
                                    /*strict=*/true, /*ignore_comments=*/false)) {
         return {};

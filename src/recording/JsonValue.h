@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/PropertyValue.h"
+#include "recording/PropertyValueBuilder.h"
 
 #include <nlohmann/json_fwd.hpp>
 
@@ -32,7 +33,7 @@ public:
     // Values nested deeper than this are refused as malformed: a hostile
     // document of a few hundred kilobytes of '[' would otherwise build a tree
     // whose recursive destruction overflows the stack.
-    static constexpr std::size_t kMaxNestingDepth = 512;
+    static constexpr std::size_t kMaxNestingDepth = PropertyValueBuilder::kMaxNestingDepth;
 
     // Strict parse of UTF-8 JSON text (no comments, no trailing text). Returns
     // an empty reference when the text is malformed, nested too deeply, or is

@@ -3,6 +3,7 @@
 #include "pipeline/Util.h"
 #include "platform/MonotonicClock.h"
 #include "platform/PropertyDictionary.h"
+#include "recording/ContainerFrames.h"
 #include "recording/ContainerWriter.h"
 #include "recording/JsonValue.h"
 
@@ -24,110 +25,21 @@ namespace {
 constexpr std::uint64_t kContainerVersion = ContainerWriter::kVersion;
 constexpr std::string_view kMigrationFailed = "migrateSerializedContainer failed: ";
 
-// Container keys and frame type names.
-constexpr std::string_view kVersionKey = "Version";
-constexpr std::string_view kFramesKey = "Frames";
-constexpr std::string_view kTypeKey = "Type";
-constexpr std::string_view kTimestampKey = "Timestamp";
-constexpr std::string_view kKeyKey = "Key";
-constexpr std::string_view kValueKey = "Value";
-constexpr std::string_view kReportKey = "Report";
-constexpr std::string_view kStateType = "State";
-constexpr std::string_view kInputReportType = "InputReport";
-// Version 0.
-constexpr std::string_view kReportsKey = "Reports";
-constexpr std::string_view kReportDataKey = "ReportData";
-
 [[noreturn]] void reject(const char* message) { throw std::invalid_argument(message); }
-
-int hexDigit(char c)
-{
-    if (c >= '0' && c <= '9') return c - '0';
-    if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-    if (c >= 'A' && c <= 'F') return c - 'A' + 10;
-    return -1;
-}
-
-// Report text as the writer produces it (two hex digits and a blank per byte)
-// is decoded directly; anything else goes to the general hex reader, which
-// accepts more forms. A stream extraction per byte would make reading a full
-// recording several times slower.
-std::vector<std::uint8_t> bytesFromReportText(const std::string& text)
-{
-    std::vector<std::uint8_t> bytes;
-    if (text.size() % 3 == 0) {
-        bytes.reserve(text.size() / 3);
-        for (std::size_t i = 0; i < text.size(); i += 3) {
-            const int high = hexDigit(text[i]);
-            const int low = hexDigit(text[i + 1]);
-            if (high < 0 || low < 0 || text[i + 2] != ' ') return Util::bytesFromHexString(text);
-            bytes.push_back(static_cast<std::uint8_t>(high << 4 | low));
-        }
-        return bytes;
-    }
-    return Util::bytesFromHexString(text);
-}
 
 PropertyValue migrateVersion0(const PropertyDictionary& container)
 {
     PropertyValue::Array frames;
-    const PropertyValue reports = container.get(kReportsKey);
+    const PropertyValue reports = container.get(ContainerFrames::kReportsKey);
     if (reports.hasValue()) {
         if (!reports.isArray()) reject("invalid reports");
         frames.reserve(reports.asArray().size());
-        for (const PropertyValue& element : reports.asArray()) {
-            if (!element.isDictionary()) reject("report is not an object");
-            const PropertyDictionary& report = element.asDictionary();
-            // Presence only: the kinds are checked by the frame reader.
-            if (!report.contains(kTimestampKey)) reject("frame lacks Timestamp");
-            if (!report.contains(kReportDataKey)) reject("frame lacks ReportData");
-            PropertyDictionary frame;
-            frame.set(std::string(kTimestampKey), report.get(kTimestampKey));
-            frame.set(std::string(kTypeKey), PropertyValue::string(std::string(kInputReportType)));
-            frame.set(std::string(kReportKey), report.get(kReportDataKey));
-            frames.push_back(PropertyValue::dictionary(std::move(frame)));
-        }
+        for (const PropertyValue& element : reports.asArray()) frames.push_back(ContainerFrames::fromVersion0(element));
     }
     PropertyDictionary migrated;
-    migrated.set(std::string(kVersionKey), PropertyValue::uint64(kContainerVersion));
-    migrated.set(std::string(kFramesKey), PropertyValue::array(std::move(frames)));
+    migrated.set(std::string(ContainerFrames::kVersionKey), PropertyValue::uint64(kContainerVersion));
+    migrated.set(std::string(ContainerFrames::kFramesKey), PropertyValue::array(std::move(frames)));
     return PropertyValue::dictionary(std::move(migrated));
-}
-
-PipelineRecording::Frame readFrame(const PropertyValue& element)
-{
-    using Frame = PipelineRecording::Frame;
-    if (!element.isDictionary()) reject("frame is not an object");
-    const PropertyDictionary& object = element.asDictionary();
-
-    // The checks run in this order, so the first missing piece is reported.
-    const PropertyValue type = object.get(kTypeKey);
-    if (!type.isString()) reject("invalid frame type");
-    const PropertyValue timestamp = object.get(kTimestampKey);
-    if (!timestamp.isNumberOrBoolean()) reject("invalid frame timestamp");
-
-    Frame frame;
-    frame.timestampNs = timestamp.toUInt64();
-    if (type.asString() == kStateType) {
-        const PropertyValue key = object.get(kKeyKey);
-        if (!key.isString()) reject("invalid state key");
-        frame.type = Frame::Type::State;
-        frame.key = key.asString();
-        // Absent means "no value"; a present entry must hold a value (JSON
-        // null included), which every parsed entry does.
-        if (object.contains(kValueKey)) {
-            frame.value = object.get(kValueKey);
-            if (!frame.value.hasValue()) reject("invalid state value class");
-        }
-    } else if (type.asString() == kInputReportType) {
-        const PropertyValue report = object.get(kReportKey);
-        if (!report.isString()) reject("invalid report");
-        frame.type = Frame::Type::InputReport;
-        frame.report = bytesFromReportText(report.asString());
-    } else {
-        reject("invalid frame type");
-    }
-    return frame;
 }
 
 }  // namespace
@@ -301,7 +213,7 @@ PropertyValue PipelineRecording::migrateSerializedContainer(PropertyValue contai
 {
     if (!container.isDictionary()) reject("invalid container");
     const PropertyDictionary& object = container.asDictionary();
-    const PropertyValue version = object.get(kVersionKey);
+    const PropertyValue version = object.get(ContainerFrames::kVersionKey);
     if (!version.isNumberOrBoolean()) reject("invalid version");
     switch (version.toUInt64()) {
     case 1:
@@ -315,10 +227,10 @@ PropertyValue PipelineRecording::migrateSerializedContainer(PropertyValue contai
 
 void PipelineRecording::readFrames(const PropertyValue& container, FrameList& frames)
 {
-    const PropertyValue array = container.asDictionary().get(kFramesKey);
+    const PropertyValue array = container.asDictionary().get(ContainerFrames::kFramesKey);
     if (!array.isArray()) reject("invalid frames");
     // Loaded as they stand: no limit, no trimming, no check of time order.
-    for (const PropertyValue& element : array.asArray()) frames.push_back(readFrame(element));
+    for (const PropertyValue& element : array.asArray()) frames.push_back(ContainerFrames::read(element));
 }
 
 std::string PipelineRecording::json()
@@ -336,8 +248,7 @@ void PipelineRecording::playReset()
 {
     _play.valid = true;
     _play.iterator = _frames.begin();
-    _play.startTimeMach = MonotonicClock::now();
-    _play.lastInputReportTimeNs.reset();
+    _play.clock.reset();
 }
 
 bool PipelineRecording::playCanContinue() const noexcept { return _play.valid && _play.iterator != _frames.end(); }
@@ -345,15 +256,27 @@ bool PipelineRecording::playCanContinue() const noexcept { return _play.valid &&
 void PipelineRecording::playNextFrame(float speed)
 {
     if (!playCanContinue()) throw std::runtime_error("playback finished");
-    if (!(speed > 0.0f)) speed = 1.0f;
-
     const Frame& frame = *_play.iterator;
     ++_play.iterator;
+    playFrame(frame, _play.clock, _frames.front().timestampNs, speed, sleepMicroseconds, pipeline.get());
+}
+
+void PipelineRecording::PlayClock::reset()
+{
+    startTimeMach = MonotonicClock::now();
+    lastInputReportTimeNs.reset();
+}
+
+void PipelineRecording::playFrame(const Frame& frame, PlayClock& clock, std::uint64_t originNs, float speed,
+                                  const std::function<void(std::uint64_t microseconds)>& sleepMicroseconds,
+                                  PipelineInput* pipeline)
+{
+    if (!(speed > 0.0f)) speed = 1.0f;
 
     if (frame.type == Frame::Type::InputReport) {
-        if (_play.lastInputReportTimeNs && frame.timestampNs > *_play.lastInputReportTimeNs) {
+        if (clock.lastInputReportTimeNs && frame.timestampNs > *clock.lastInputReportTimeNs) {
             // Single precision throughout, truncated to whole microseconds.
-            const float elapsedNs = static_cast<float>(frame.timestampNs - *_play.lastInputReportTimeNs);
+            const float elapsedNs = static_cast<float>(frame.timestampNs - *clock.lastInputReportTimeNs);
             const float microseconds = elapsedNs / speed / 1000.0f;
             // A tiny speed can push the wait past what 64 bits hold.
             constexpr float kLongestWait = 18446744073709551615.0f;
@@ -361,15 +284,13 @@ void PipelineRecording::playNextFrame(float speed)
                                                                   : std::numeric_limits<std::uint64_t>::max();
             if (sleepMicroseconds) sleepMicroseconds(wait);
         }
-        _play.lastInputReportTimeNs = frame.timestampNs;
+        clock.lastInputReportTimeNs = frame.timestampNs;
     }
 
     if (!pipeline) return;
 
-    // The replayed time line starts at playReset and keeps the recorded
-    // spacing whatever the speed; it is measured from the list's first frame.
-    const std::uint64_t offsetNs = frame.timestampNs - _frames.front().timestampNs;
-    pipeline->setTime(_play.startTimeMach + Util::machTimeFromNanoseconds(offsetNs));
+    // The replayed time line keeps the recorded spacing whatever the speed.
+    pipeline->setTime(clock.startTimeMach + Util::machTimeFromNanoseconds(frame.timestampNs - originNs));
     switch (frame.type) {
     case Frame::Type::InputReport:
         pipeline->handleInputReport(frame.report.data(), frame.report.size());
@@ -379,5 +300,6 @@ void PipelineRecording::playNextFrame(float speed)
         break;
     }
 }
+
 
 }  // namespace VeltoTouch

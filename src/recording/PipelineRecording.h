@@ -106,12 +106,28 @@ public:
     // frame to play.
     void playNextFrame(float speed);
 
+    // Where a playback stands on the recorded time line.
+    struct PlayClock {
+        std::uint64_t startTimeMach = 0;
+        std::optional<std::uint64_t> lastInputReportTimeNs;
+        // The time line starts now; the next report does not wait.
+        void reset();
+    };
+    // Plays one frame as playNextFrame does, for a recording that is not held
+    // in memory (ContainerStream): waits the recorded spacing since the
+    // previous input report divided by `speed`, sets the pipeline's time to
+    // the clock's start plus the frame's offset from `originNs` (the time
+    // stamp of the recording's first frame) and hands the frame over.
+    // `pipeline` may be null (only the wait happens).
+    static void playFrame(const Frame& frame, PlayClock& clock, std::uint64_t originNs, float speed,
+                          const std::function<void(std::uint64_t microseconds)>& sleepMicroseconds,
+                          PipelineInput* pipeline);
+
 private:
     struct PlayCursor {
         bool valid = false;
         FrameList::iterator iterator;
-        std::uint64_t startTimeMach = 0;
-        std::optional<std::uint64_t> lastInputReportTimeNs;
+        PlayClock clock;
     };
 
     bool trimIsDue() const noexcept;

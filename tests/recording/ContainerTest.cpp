@@ -1,12 +1,15 @@
 #include "RecordingTestSupport.h"
 
 #include "platform/PropertyDictionary.h"
+#include "recording/ContainerStream.h"
 #include "recording/JsonValue.h"
 
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
 #include <cmath>
+#include <cstdio>
+#include <unistd.h>
 #include <limits>
 #include <optional>
 #include <stdexcept>
@@ -17,6 +20,24 @@ namespace {
 using namespace RecordingTestSupport;
 using VeltoHost::PropertyDictionary;
 using VeltoTouch::JsonValue;
+
+// Frames of a container text as ContainerStream hands them over, from a
+// file in memory (seekable, like a file on disk).
+PipelineRecording::FrameList streamFrames(const std::string& text, std::size_t* handedBeforeFault = nullptr)
+{
+    std::FILE* file = ::fmemopen(const_cast<char*>(text.data()), text.size(), "r");
+    if (text.empty()) file = std::tmpfile();  // fmemopen refuses a size of 0
+    PipelineRecording::FrameList frames;
+    try {
+        VeltoTouch::ContainerStream::read(file, [&](Frame&& frame) { frames.push_back(std::move(frame)); });
+    } catch (...) {
+        std::fclose(file);
+        if (handedBeforeFault) *handedBeforeFault = frames.size();
+        throw;
+    }
+    std::fclose(file);
+    return frames;
+}
 
 void expectSameFrames(const PipelineRecording::FrameList& actual, const PipelineRecording::FrameList& expected)
 {
@@ -87,6 +108,54 @@ TEST(RecordingContainer, FramesRoundTripWithValuesNoValueNullAndReportsOfEveryLe
     PipelineRecording readBack{std::string_view(text)};
     expectSameFrames(readBack.frames(), recording.frames());
     EXPECT_EQ(readBack.json(), text) << "writing the read recording gives the same container";
+    expectSameFrames(streamFrames(text), recording.frames());
+}
+
+TEST(RecordingContainer, AStreamedContainerHandsOverWhatTheWholeTextReaderReads)
+{
+    const std::string report = R"("Type": "InputReport", "Timestamp": 5, "Report": "01 ff ")";
+    const std::string cases[] = {
+        // Key order, repeated keys, booleans for numbers, other keys at every level.
+        R"({"Note": {"deep": [[1], {"x": null}]}, "Version": 1, "Frames": [
+            {"Report": "0a ", "Timestamp": true, "Type": "InputReport", "Extra": [1, 2]},
+            {"Type": "State", "Timestamp": 3.9, "Key": "k", "Value": {"b": [1, -2, 1.5e300, "\u00e9"]}},
+            {"Type": "State", "Timestamp": 4, "Key": "k", "Key": "later", "Value": -0},
+            {)" + report + R"(}], "After": "x"})",
+        "\xEF\xBB\xBF" R"({"Version": 1, "Frames": [{)" + report + "}]}",
+        R"({"Version": 0, "Frames": "ignored", "Reports": [{"ReportData": "02 ", "Timestamp": 9, "Other": 1}]})",
+        R"({"Version": 1, "Reports": "ignored", "Frames": []})",
+        // The frames before the version: read whole from the start.
+        R"({"Frames": [{)" + report + R"(}], "Version": 1})",
+    };
+    for (const std::string& text : cases) {
+        SCOPED_TRACE(text);
+        PipelineRecording whole{std::string_view(text)};
+        expectSameFrames(streamFrames(text), whole.frames());
+    }
+
+    // A fault is raised where it is reached, after the frames before it.
+    std::size_t handed = 0;
+    EXPECT_THROW(streamFrames(R"({"Version": 1, "Frames": [{)" + report + "}, {" + report + R"(}, {"Type": 1}]})",
+                              &handed),
+                 std::invalid_argument);
+    EXPECT_EQ(handed, 2u);
+    EXPECT_THROW(streamFrames(R"({"Version": 1, "Frames": [{)" + report + "}, ", &handed), std::runtime_error);
+    EXPECT_EQ(handed, 1u);
+
+    // Frames before the version from an input that cannot be read again.
+    int ends[2];
+    ASSERT_EQ(::pipe(ends), 0);
+    const std::string early = R"({"Frames": [], "Version": 1})";
+    ASSERT_EQ(::write(ends[1], early.data(), early.size()), static_cast<ssize_t>(early.size()));
+    ::close(ends[1]);
+    std::FILE* pipe = ::fdopen(ends[0], "r");
+    try {
+        VeltoTouch::ContainerStream::read(pipe, [](Frame&&) {});
+        ADD_FAILURE() << "frames before the version were taken from a pipe";
+    } catch (const std::runtime_error& error) {
+        EXPECT_NE(std::string(error.what()).find("before its \"Version\""), std::string::npos) << error.what();
+    }
+    std::fclose(pipe);
 }
 
 TEST(RecordingContainer, ValuesJsonCannotHoldAreWrittenWithoutFailing)
@@ -227,21 +296,29 @@ TEST(RecordingContainer, EveryFaultRaisesItsMessageInItsFamily)
         {"second frame faulty", v1 + R"({"Type": "State", "Timestamp": 1, "Key": "k"}, {"Type": "State"}]})",
          Family::InvalidArgument, "invalid frame timestamp"},
     };
-    for (const ReadError& c : cases) {
-        SCOPED_TRACE(c.name);
-        try {
-            const std::optional<std::string_view> input =
-                c.input ? std::optional<std::string_view>(*c.input) : std::nullopt;
-            PipelineRecording recording(input);
-            ADD_FAILURE() << "no error raised";
-        } catch (const std::invalid_argument& error) {
-            EXPECT_EQ(c.family, Family::InvalidArgument);
-            EXPECT_EQ(error.what(), c.message);
-        } catch (const std::runtime_error& error) {
-            EXPECT_EQ(c.family, Family::Runtime);
-            EXPECT_EQ(error.what(), c.message);
-        } catch (...) {
-            ADD_FAILURE() << "unexpected exception type";
+    // The same through both readers: the whole text, and the file streamed.
+    for (const bool streamed : {false, true}) {
+        for (const ReadError& c : cases) {
+            SCOPED_TRACE(std::string(c.name) + (streamed ? " (streamed)" : ""));
+            if (streamed && !c.input) continue;
+            try {
+                const std::optional<std::string_view> input =
+                    c.input ? std::optional<std::string_view>(*c.input) : std::nullopt;
+                if (streamed) {
+                    streamFrames(*c.input);
+                } else {
+                    PipelineRecording recording(input);
+                }
+                ADD_FAILURE() << "no error raised";
+            } catch (const std::invalid_argument& error) {
+                EXPECT_EQ(c.family, Family::InvalidArgument);
+                EXPECT_EQ(error.what(), c.message);
+            } catch (const std::runtime_error& error) {
+                EXPECT_EQ(c.family, Family::Runtime);
+                EXPECT_EQ(error.what(), c.message);
+            } catch (...) {
+                ADD_FAILURE() << "unexpected exception type";
+            }
         }
     }
 }

@@ -1,0 +1,36 @@
+#pragma once
+
+#include "recording/PipelineRecording.h"
+
+#include <cstdio>
+#include <functional>
+
+namespace VeltoTouch {
+
+// Reads a recording container as it arrives and hands over each frame as
+// soon as it is complete, so that a recording of any length plays in bounded
+// memory: the frame objects one at a time, nothing else kept.
+//
+// It accepts and refuses what PipelineRecording(data) does, with the same
+// messages, but each fault is raised where it is reached: the frames before
+// it have already been handed over. Where a container has more than one
+// fault, the first in the file is the one reported (the whole-text reader
+// reports malformed JSON anywhere first, and version-0 presence checks before
+// kinds). Two shapes cannot be read as they arrive:
+// - the frames come before "Version" (key order carries no meaning): the
+//   file is then read whole and handed over from memory, when it can be read
+//   again from its start; otherwise std::runtime_error says why;
+// - "Version", "Frames" or "Reports" is repeated after frames were handed
+//   over: refused as an invalid container, since the frames already played
+//   cannot be taken back.
+class ContainerStream {
+public:
+    // Called with each frame in file order; may throw to stop the read (the
+    // exception reaches the caller of read()).
+    using FrameHandler = std::function<void(PipelineRecording::Frame&& frame)>;
+
+    // Reads from the file's current position to its end. The file stays open.
+    static void read(std::FILE* file, const FrameHandler& onFrame);
+};
+
+}  // namespace VeltoTouch

@@ -1,0 +1,80 @@
+#pragma once
+
+#include "platform/PropertyDictionary.h"
+#include "platform/PropertyValue.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace VeltoTouch {
+
+using VeltoHost::PropertyValue;
+
+// Builds one PropertyValue tree from a parser's events (SAX), so that a
+// document is parsed into one tree only, not an intermediate JSON tree that
+// is then converted. Both JSON readers use it, the whole-text one and the
+// one that streams a recording, so that a value reads the same through
+// either: non-negative integers as uint64, negative ones as int64, the rest
+// as float64; a repeated key keeps its first position and takes the later
+// value; more than kMaxNestingDepth levels are refused.
+//
+// The member names are those of nlohmann's SAX interface, which takes the
+// builder directly. Each returns false to stop the parse.
+class PropertyValueBuilder {
+public:
+    static constexpr std::size_t kMaxNestingDepth = 512;
+
+    // Whether a scalar alone is a complete document.
+    explicit PropertyValueBuilder(bool scalarTopLevelAllowed) : _scalarTopLevelAllowed(scalarTopLevelAllowed) {}
+
+    PropertyValue takeResult() { return std::move(_result); }
+
+    bool null() { return addScalar(PropertyValue::null()); }
+    bool boolean(bool value) { return addScalar(PropertyValue::boolean(value)); }
+    // Negative integers (and "-0").
+    bool number_integer(std::int64_t value)
+    {
+        return addScalar(value < 0 ? PropertyValue::int64(value) : PropertyValue::uint64(static_cast<std::uint64_t>(value)));
+    }
+    bool number_unsigned(std::uint64_t value) { return addScalar(PropertyValue::uint64(value)); }
+    bool number_float(double value, const std::string&) { return addScalar(PropertyValue::float64(value)); }
+    bool string(std::string& value) { return addScalar(PropertyValue::string(std::move(value))); }
+    // Only binary formats produce these; JSON text never does.
+    template <typename Binary>
+    bool binary(Binary&)
+    {
+        return false;
+    }
+
+    bool start_object(std::size_t = 0) { return open(true); }
+    bool key(std::string& key);
+    bool end_object();
+    bool start_array(std::size_t = 0) { return open(false); }
+    bool end_array();
+
+    template <typename Exception>
+    bool parse_error(std::size_t, const std::string&, const Exception&)
+    {
+        return false;
+    }
+
+private:
+    struct Level {
+        bool isObject = false;
+        PropertyValue::Array items;
+        VeltoHost::PropertyDictionary entries;
+        std::string key;
+    };
+
+    bool open(bool isObject);
+    bool addScalar(PropertyValue value);
+    bool add(PropertyValue value);
+
+    bool _scalarTopLevelAllowed;
+    std::vector<Level> _levels;
+    PropertyValue _result;
+};
+
+}  // namespace VeltoTouch
