@@ -3,6 +3,8 @@
 #include "pipeline/Util.h"
 #include "platform/PropertyDictionary.h"
 
+#include <array>
+#include <cstdint>
 #include <stdexcept>
 #include <string>
 #include <utility>
@@ -24,13 +26,18 @@ constexpr std::string_view kReportDataKey = "ReportData";
 
 [[noreturn]] void reject(const char* message) { throw std::invalid_argument(message); }
 
-int hexDigit(char c)
-{
-    if (c >= '0' && c <= '9') return c - '0';
-    if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-    if (c >= 'A' && c <= 'F') return c - 'A' + 10;
-    return -1;
-}
+// The value of each hex digit character, -1 for every other byte: one
+// lookup per character instead of three range tests.
+constexpr std::array<std::int8_t, 256> kHexDigits = [] {
+    std::array<std::int8_t, 256> digits{};
+    digits.fill(-1);
+    for (int c = '0'; c <= '9'; ++c) digits[c] = static_cast<std::int8_t>(c - '0');
+    for (int c = 'a'; c <= 'f'; ++c) digits[c] = static_cast<std::int8_t>(c - 'a' + 10);
+    for (int c = 'A'; c <= 'F'; ++c) digits[c] = static_cast<std::int8_t>(c - 'A' + 10);
+    return digits;
+}();
+
+int hexDigit(char c) { return kHexDigits[static_cast<unsigned char>(c)]; }
 
 // Report text as the writer produces it (two hex digits and a blank per byte)
 // is decoded directly; anything else goes to the general hex reader, which
@@ -38,14 +45,13 @@ int hexDigit(char c)
 // recording several times slower.
 std::vector<std::uint8_t> bytesFromReportText(const std::string& text)
 {
-    std::vector<std::uint8_t> bytes;
     if (text.size() % 3 == 0) {
-        bytes.reserve(text.size() / 3);
-        for (std::size_t i = 0; i < text.size(); i += 3) {
+        std::vector<std::uint8_t> bytes(text.size() / 3);
+        for (std::size_t i = 0, b = 0; i < text.size(); i += 3, ++b) {
             const int high = hexDigit(text[i]);
             const int low = hexDigit(text[i + 1]);
-            if (high < 0 || low < 0 || text[i + 2] != ' ') return Util::bytesFromHexString(text);
-            bytes.push_back(static_cast<std::uint8_t>(high << 4 | low));
+            if ((high | low) < 0 || text[i + 2] != ' ') return Util::bytesFromHexString(text);
+            bytes[b] = static_cast<std::uint8_t>(high << 4 | low);
         }
         return bytes;
     }
@@ -68,36 +74,63 @@ PropertyValue ContainerFrames::fromVersion0(const PropertyValue& element)
     return PropertyValue::dictionary(std::move(frame));
 }
 
+ContainerFrames::Field ContainerFrames::Field::of(PropertyValue value)
+{
+    Field field;
+    field.present = true;
+    if (value.isString()) {
+        field.isText = true;
+        field.text = value.asString();
+    }
+    field.value = std::move(value);
+    return field;
+}
+
+ContainerFrames::Field& ContainerFrames::Fields::named(std::string_view name)
+{
+    if (name == kTypeKey) return type;
+    if (name == kTimestampKey) return timestamp;
+    if (name == kKeyKey) return key;
+    if (name == kValueKey) return value;
+    if (name == kReportKey) return report;
+    return other;
+}
+
 PipelineRecording::Frame ContainerFrames::read(const PropertyValue& element)
 {
-    using Frame = PipelineRecording::Frame;
     if (!element.isDictionary()) reject("frame is not an object");
-    const PropertyDictionary& object = element.asDictionary();
+    Fields fields;
+    for (const auto& [name, value] : element.asDictionary()) {
+        Field& field = fields.named(name);
+        if (&field != &fields.other) field = Field::of(value);
+    }
+    return read(std::move(fields));
+}
 
+PipelineRecording::Frame ContainerFrames::read(Fields&& fields)
+{
+    using Frame = PipelineRecording::Frame;
     // The checks run in this order, so the first missing piece is reported.
-    const PropertyValue type = object.get(kTypeKey);
-    if (!type.isString()) reject("invalid frame type");
-    const PropertyValue timestamp = object.get(kTimestampKey);
-    if (!timestamp.isNumberOrBoolean()) reject("invalid frame timestamp");
+    if (!fields.type.isText) reject("invalid frame type");
+    if (!fields.timestamp.present || !fields.timestamp.value.isNumberOrBoolean()) reject("invalid frame timestamp");
 
     Frame frame;
-    frame.timestampNs = timestamp.toUInt64();
-    if (type.asString() == kStateType) {
-        const PropertyValue key = object.get(kKeyKey);
-        if (!key.isString()) reject("invalid state key");
+    frame.timestampNs = fields.timestamp.value.toUInt64();
+    if (fields.type.text == kStateType) {
+        if (!fields.key.isText) reject("invalid state key");
         frame.type = Frame::Type::State;
-        frame.key = key.asString();
+        frame.key = std::move(fields.key.text);
         // Absent means "no value"; a present entry must hold a value (JSON
         // null included), which every parsed entry does.
-        if (object.contains(kValueKey)) {
-            frame.value = object.get(kValueKey);
+        if (fields.value.present) {
+            frame.value = fields.value.isText ? PropertyValue::string(std::move(fields.value.text))
+                                              : std::move(fields.value.value);
             if (!frame.value.hasValue()) reject("invalid state value class");
         }
-    } else if (type.asString() == kInputReportType) {
-        const PropertyValue report = object.get(kReportKey);
-        if (!report.isString()) reject("invalid report");
+    } else if (fields.type.text == kInputReportType) {
+        if (!fields.report.isText) reject("invalid report");
         frame.type = Frame::Type::InputReport;
-        frame.report = bytesFromReportText(report.asString());
+        frame.report = bytesFromReportText(fields.report.text);
     } else {
         reject("invalid frame type");
     }

@@ -2,6 +2,7 @@
 
 #include "recording/PipelineRecording.h"
 
+#include <string>
 #include <string_view>
 
 namespace VeltoTouch {
@@ -22,6 +23,25 @@ public:
     // timestamp", "invalid state key", "invalid state value class", "invalid
     // report", "invalid hex string", the first that applies in that order.
     static PipelineRecording::Frame read(const PropertyValue& element);
+
+    // One entry of a frame object, as much of it as the checks need. A text
+    // is kept as text, so that a reader that streams need not wrap each
+    // report in a value; any other value is kept whole.
+    struct Field {
+        bool present = false;
+        bool isText = false;
+        std::string text;
+        PropertyValue value;  // when not text (a value of any kind, or null for an object or array)
+
+        static Field of(PropertyValue value);
+    };
+    // The entries of a frame object that mean something; `other` takes the rest.
+    struct Fields {
+        Field type, timestamp, key, value, report, other;
+        Field& named(std::string_view name);
+    };
+    // The same checks and frame as read(element), from the entries alone.
+    static PipelineRecording::Frame read(Fields&& fields);
 
     // A version-0 report object as the version-1 frame object it becomes.
     // Only presence is checked here ("report is not an object", "frame lacks

@@ -12,6 +12,7 @@
 #include <stdexcept>
 #include <string>
 #include <string_view>
+#include <utility>
 
 namespace VeltoTouch {
 
@@ -30,10 +31,69 @@ constexpr std::size_t kReadBufferBytes = 1 << 16;
 // Raised when the frames come before the version: the file must be read whole.
 struct FramesBeforeVersion {};
 
+// Whether text is well-formed UTF-8 (no overlong forms, no surrogates,
+// nothing past U+10FFFF), as the whole-text reader requires of strings.
+bool isUtf8(const char* text, std::size_t length)
+{
+    const auto* bytes = reinterpret_cast<const unsigned char*>(text);
+    std::size_t i = 0;
+    while (i < length) {
+        const unsigned char lead = bytes[i];
+        if (lead < 0x80) {
+            ++i;
+            continue;
+        }
+        std::size_t count = 0;
+        unsigned char low = 0x80;
+        unsigned char high = 0xBF;
+        if (lead >= 0xC2 && lead <= 0xDF) {
+            count = 1;
+        } else if (lead >= 0xE0 && lead <= 0xEF) {
+            count = 2;
+            if (lead == 0xE0) low = 0xA0;
+            if (lead == 0xED) high = 0x9F;
+        } else if (lead >= 0xF0 && lead <= 0xF4) {
+            count = 3;
+            if (lead == 0xF0) low = 0x90;
+            if (lead == 0xF4) high = 0x8F;
+        } else {
+            return false;
+        }
+        if (i + count >= length) return false;  // cut short
+        if (bytes[i + 1] < low || bytes[i + 1] > high) return false;
+        for (std::size_t k = 2; k <= count; ++k) {
+            if (bytes[i + k] < 0x80 || bytes[i + k] > 0xBF) return false;
+        }
+        i += count + 1;
+    }
+    return true;
+}
+
+// A string of the container; RapidJSON is asked not to validate encodings
+// (it would check every byte of every report), so only text with bytes past
+// ASCII is checked here.
+std::string checkedText(const char* text, rapidjson::SizeType length)
+{
+    // Eight bytes at a time: any of them past ASCII has its top bit set.
+    constexpr std::uint64_t kTopBits = 0x8080808080808080u;
+    std::uint64_t any = 0;
+    rapidjson::SizeType i = 0;
+    for (; i + 8 <= length; i += 8) {
+        std::uint64_t word;
+        std::memcpy(&word, text + i, sizeof word);
+        any |= word;
+    }
+    for (; i < length; ++i) any |= static_cast<unsigned char>(text[i]);
+    if ((any & kTopBits) != 0 && !isUtf8(text, length)) rejectContainer("invalid container");
+    return std::string(text, length);
+}
+
 // The container's structure, followed event by event (RapidJSON's SAX
-// interface). Values that matter whole (the version, each frame object) are
-// built with the same builder as the whole-text reader's and judged by the
-// same code; everything else is only counted through.
+// interface). Version-1 frame objects are taken apart as they pass: each
+// entry that matters is kept as ContainerFrames reads it, the rest counted
+// through. Values that matter whole (the version, a state frame's value,
+// anything in a version-0 container or where a frame object should be) are
+// built with the whole-text reader's builder and judged by the same code.
 class StreamHandler {
 public:
     explicit StreamHandler(const ContainerStream::FrameHandler& onFrame) : _onFrame(onFrame) {}
@@ -41,44 +101,47 @@ public:
     // Why the parse stopped early, if the handler stopped it.
     std::exception_ptr failure() const { return _failure; }
 
-    bool Null() { return event([&] { return scalar([](PropertyValueBuilder& b) { return b.null(); }); }); }
-    bool Bool(bool value)
-    {
-        return event([&] { return scalar([&](PropertyValueBuilder& b) { return b.boolean(value); }); });
-    }
+    bool Null() { return event([&] { return scalar(PropertyValue::null()); }); }
+    bool Bool(bool value) { return event([&] { return scalar(PropertyValue::boolean(value)); }); }
     bool Int(int value) { return Int64(value); }
     bool Uint(unsigned value) { return Uint64(value); }
+    // Negative integers only (and "-0"), as the builder expects them.
     bool Int64(std::int64_t value)
     {
-        return event([&] { return scalar([&](PropertyValueBuilder& b) { return b.number_integer(value); }); });
+        return event([&] {
+            return scalar(value < 0 ? PropertyValue::int64(value)
+                                    : PropertyValue::uint64(static_cast<std::uint64_t>(value)));
+        });
     }
-    bool Uint64(std::uint64_t value)
-    {
-        return event([&] { return scalar([&](PropertyValueBuilder& b) { return b.number_unsigned(value); }); });
-    }
-    bool Double(double value)
-    {
-        static const std::string kNoText;
-        return event([&] { return scalar([&](PropertyValueBuilder& b) { return b.number_float(value, kNoText); }); });
-    }
+    bool Uint64(std::uint64_t value) { return event([&] { return scalar(PropertyValue::uint64(value)); }); }
+    bool Double(double value) { return event([&] { return scalar(PropertyValue::float64(value)); }); }
     bool RawNumber(const char*, rapidjson::SizeType, bool) { return false; }  // not asked for
     bool String(const char* text, rapidjson::SizeType length, bool)
     {
         return event([&] {
-            return scalar([&](PropertyValueBuilder& b) {
-                std::string value(text, length);
-                return b.string(value);
-            });
+            if (_skipUntilDepth) return true;
+            if (_fields && !_capture) {
+                ContainerFrames::Field& field = *_field;
+                field.present = true;
+                field.isText = true;
+                field.text = checkedText(text, length);
+                field.value = PropertyValue();
+                return true;
+            }
+            return scalar(PropertyValue::string(checkedText(text, length)));
         });
     }
     bool Key(const char* text, rapidjson::SizeType length, bool)
     {
         return event([&] {
-            if (_capture) {
-                std::string key(text, length);
-                return _capture->key(key);
+            if (_skipUntilDepth) return true;
+            std::string key = checkedText(text, length);
+            if (_capture) return _capture->key(key);
+            if (_fields) {
+                _field = &_fields->named(key);
+            } else if (_place == Place::Top) {
+                _topKey = topKeyOf(key);
             }
-            if (_place == Place::Top && _depth == 1) _topKey = topKeyOf(std::string_view(text, length));
             return true;
         });
     }
@@ -88,9 +151,9 @@ public:
     bool EndArray(rapidjson::SizeType) { return event([&] { return close(false); }); }
 
 private:
-    enum class Place { BeforeTop, Top, Frames, Reports, Skipping, AfterTop };
+    enum class Place { BeforeTop, Top, Frames, Reports, AfterTop };
     enum class TopKey { Version, Frames, Reports, Other };
-    enum class Captured { Version, Frame };
+    enum class Captured { Version, Element, StateValue };
 
     static TopKey topKeyOf(std::string_view key)
     {
@@ -111,25 +174,50 @@ private:
         }
     }
 
-    // A scalar value: into the value being built, or judged where it stands.
-    template <typename Add>
-    bool scalar(Add add)
+    // Adds a scalar to the value being built; false when the builder refuses it.
+    bool addTo(PropertyValueBuilder& builder, PropertyValue value)
     {
+        switch (value.kind()) {
+        case PropertyValue::Kind::Null: return builder.null();
+        case PropertyValue::Kind::Boolean: return builder.boolean(value.asBoolean());
+        case PropertyValue::Kind::String: {
+            std::string text = value.asString();
+            return builder.string(text);
+        }
+        default: break;
+        }
+        using NumberType = PropertyValue::NumberType;
+        static const std::string kNoText;
+        switch (value.numberType()) {
+        case NumberType::Int32:
+        case NumberType::Int64: return builder.number_integer(value.toInt64());
+        case NumberType::UInt32:
+        case NumberType::UInt64: return builder.number_unsigned(value.toUInt64());
+        default: return builder.number_float(value.toDouble(), kNoText);
+        }
+    }
+
+    bool scalar(PropertyValue value)
+    {
+        if (_skipUntilDepth) return true;
         if (_capture) {
-            if (!add(*_capture)) rejectContainer("invalid container");
+            if (!addTo(*_capture, std::move(value))) rejectContainer("invalid container");
             if (_depth == _captureDepth) finishCapture();
+            return true;
+        }
+        if (_fields) {
+            *_field = ContainerFrames::Field::of(std::move(value));
             return true;
         }
         switch (_place) {
         case Place::BeforeTop: rejectContainer("invalid container");
-        case Place::Top: return topValue(false, [&](PropertyValueBuilder& b) { return add(b); });
+        case Place::Top: return topValue(std::move(value));
         case Place::Frames:
         case Place::Reports:
-            beginCapture(Captured::Frame);
-            add(*_capture);
+            beginCapture(Captured::Element, _depth);
+            if (!addTo(*_capture, std::move(value))) rejectContainer("invalid container");
             finishCapture();
             return true;
-        case Place::Skipping:
         case Place::AfterTop: return true;
         }
         return true;
@@ -138,24 +226,39 @@ private:
     bool open(bool isObject)
     {
         if (_depth >= PropertyValueBuilder::kMaxNestingDepth) rejectContainer("invalid container");
-        ++_depth;
+        const std::size_t outside = _depth++;
+        if (_skipUntilDepth) return true;
         if (_capture) return isObject ? _capture->start_object() : _capture->start_array();
+        if (_fields) {
+            // The value of an entry of a frame object.
+            if (_field == &_fields->value) {
+                beginCapture(Captured::StateValue, outside);
+                return isObject ? _capture->start_object() : _capture->start_array();
+            }
+            if (_field != &_fields->other) {
+                // Neither text nor a number: what the checks need to know of it.
+                *_field = ContainerFrames::Field::of(PropertyValue::null());
+            }
+            _skipUntilDepth = outside;
+            return true;
+        }
         switch (_place) {
         case Place::BeforeTop:
             if (!isObject) rejectContainer("invalid container");
             _place = Place::Top;
             return true;
-        case Place::Top: {
-            --_depth;  // topValue counts the level again where it keeps it
-            return topValue(true, [&](PropertyValueBuilder& b) {
-                return isObject ? b.start_object() : b.start_array();
-            }, isObject);
-        }
+        case Place::Top: return topContainer(isObject, outside);
         case Place::Frames:
+            if (isObject) {
+                _fields.emplace();
+                _field = &_fields->other;
+                _frameDepth = _depth;
+                return true;
+            }
+            [[fallthrough]];
         case Place::Reports:
-            beginCapture(Captured::Frame, _depth - 1);
+            beginCapture(Captured::Element, outside);
             return isObject ? _capture->start_object() : _capture->start_array();
-        case Place::Skipping:
         case Place::AfterTop: return true;
         }
         return true;
@@ -164,9 +267,20 @@ private:
     bool close(bool isObject)
     {
         --_depth;
+        if (_skipUntilDepth) {
+            if (_depth == *_skipUntilDepth) _skipUntilDepth.reset();
+            return true;
+        }
         if (_capture) {
             if (!(isObject ? _capture->end_object() : _capture->end_array())) rejectContainer("invalid container");
             if (_depth == _captureDepth) finishCapture();
+            return true;
+        }
+        if (_fields) {
+            // The frame object ends.
+            ContainerFrames::Fields fields = std::move(*_fields);
+            _fields.reset();
+            _onFrame(ContainerFrames::read(std::move(fields)));
             return true;
         }
         switch (_place) {
@@ -174,9 +288,6 @@ private:
         case Place::Reports:
             _place = Place::Top;
             _framesSeen = true;
-            return true;
-        case Place::Skipping:
-            if (_depth == 1) _place = Place::Top;
             return true;
         case Place::Top:
             // The end of the container: what was never given is missing.
@@ -190,66 +301,88 @@ private:
         return true;
     }
 
-    // The value of a key of the container itself; `opens` when it begins
-    // with '{' or '['.
-    template <typename Add>
-    bool topValue(bool opens, Add add, bool isObject = false)
+    // A scalar value of a key of the container itself.
+    bool topValue(PropertyValue value)
     {
-        const TopKey key = _topKey;
-        _topKey = TopKey::Other;
-        if (opens) ++_depth;
+        const TopKey key = std::exchange(_topKey, TopKey::Other);
         if (key == TopKey::Version) {
             if (_framesSeen) rejectContainer("invalid container");
-            beginCapture(Captured::Version, opens ? _depth - 1 : _depth);
-            if (!add(*_capture)) rejectContainer("invalid container");
-            if (!opens) finishCapture();
+            beginCapture(Captured::Version, _depth);
+            if (!addTo(*_capture, std::move(value))) rejectContainer("invalid container");
+            finishCapture();
             return true;
         }
-        const bool frames = key == TopKey::Frames;
-        if (frames || key == TopKey::Reports) {
-            if (!_version) throw FramesBeforeVersion{};
-            const bool wanted = frames == (*_version == 1);
-            if (wanted) {
-                if (_framesSeen) rejectContainer("invalid container");
-                if (!opens || isObject) {
-                    if (frames) throw std::invalid_argument("invalid frames");
-                    rejectContainer("invalid reports");
-                }
-                _place = frames ? Place::Frames : Place::Reports;
-                return true;
-            }
+        if (wantedFrames(key)) {
+            if (key == TopKey::Frames) throw std::invalid_argument("invalid frames");
+            rejectContainer("invalid reports");
         }
-        if (opens) _place = Place::Skipping;
         return true;
     }
 
-    void beginCapture(Captured what) { beginCapture(what, _depth); }
-    void beginCapture(Captured what, std::size_t depth)
+    // An object or array as the value of a key of the container itself.
+    bool topContainer(bool isObject, std::size_t outside)
+    {
+        const TopKey key = std::exchange(_topKey, TopKey::Other);
+        if (key == TopKey::Version) {
+            if (_framesSeen) rejectContainer("invalid container");
+            beginCapture(Captured::Version, outside);
+            return isObject ? _capture->start_object() : _capture->start_array();
+        }
+        if (wantedFrames(key)) {
+            if (isObject) {
+                if (key == TopKey::Frames) throw std::invalid_argument("invalid frames");
+                rejectContainer("invalid reports");
+            }
+            _place = key == TopKey::Frames ? Place::Frames : Place::Reports;
+            return true;
+        }
+        _skipUntilDepth = outside;
+        return true;
+    }
+
+    // Whether `key` holds the frames of this container's version.
+    bool wantedFrames(TopKey key)
+    {
+        if (key != TopKey::Frames && key != TopKey::Reports) return false;
+        if (!_version) throw FramesBeforeVersion{};
+        if ((key == TopKey::Frames) != (*_version == 1)) return false;  // the other version's: dropped
+        if (_framesSeen) rejectContainer("invalid container");
+        return true;
+    }
+
+    void beginCapture(Captured what, std::size_t outside)
     {
         _capture.emplace(/*scalarTopLevelAllowed=*/true);
         _captured = what;
-        _captureDepth = depth;
+        _captureDepth = outside;
     }
 
     void finishCapture()
     {
         PropertyValue value = _capture->takeResult();
         _capture.reset();
-        if (_captured == Captured::Version) {
+        switch (_captured) {
+        case Captured::Version: {
             if (!value.isNumberOrBoolean()) rejectContainer("invalid version");
             const std::uint64_t version = value.toUInt64();
             if (version > 1) rejectContainer("invalid container version: " + std::to_string(version));
             _version = version;
             return;
         }
-        if (_place == Place::Reports) {
-            try {
-                value = ContainerFrames::fromVersion0(value);
-            } catch (const std::invalid_argument& error) {
-                rejectContainer(error.what());
+        case Captured::StateValue:
+            _fields->value = ContainerFrames::Field::of(std::move(value));
+            return;
+        case Captured::Element:
+            if (_place == Place::Reports) {
+                try {
+                    value = ContainerFrames::fromVersion0(value);
+                } catch (const std::invalid_argument& error) {
+                    rejectContainer(error.what());
+                }
             }
+            _onFrame(ContainerFrames::read(value));
+            return;
         }
-        _onFrame(ContainerFrames::read(value));
     }
 
     const ContainerStream::FrameHandler& _onFrame;
@@ -260,10 +393,17 @@ private:
     TopKey _topKey = TopKey::Other;
     std::optional<std::uint64_t> _version;
     bool _framesSeen = false;
+    // Inside a value that is only counted through, until _depth is back here.
+    std::optional<std::size_t> _skipUntilDepth;
+
+    // The version-1 frame object being read, and the entry whose value comes next.
+    std::optional<ContainerFrames::Fields> _fields;
+    ContainerFrames::Field* _field = nullptr;
+    std::size_t _frameDepth = 0;
 
     std::optional<PropertyValueBuilder> _capture;
-    Captured _captured = Captured::Frame;
-    std::size_t _captureDepth = 0;  // _depth where the captured value ends
+    Captured _captured = Captured::Element;
+    std::size_t _captureDepth = 0;  // _depth outside the value being built
 };
 
 }  // namespace
@@ -279,8 +419,7 @@ void ContainerStream::read(std::FILE* file, const FrameHandler& onFrame)
     }
     StreamHandler handler(onFrame);
     rapidjson::Reader reader;
-    constexpr unsigned kFlags =
-        rapidjson::kParseValidateEncodingFlag | rapidjson::kParseFullPrecisionFlag | rapidjson::kParseIterativeFlag;
+    constexpr unsigned kFlags = rapidjson::kParseFullPrecisionFlag | rapidjson::kParseIterativeFlag;
 
     bool framesBeforeVersion = false;
     if (!reader.Parse<kFlags>(input, handler)) {
