@@ -69,16 +69,20 @@ void printSummary(const PropertyValue& stats, std::uint64_t discarded, std::ostr
 struct Device {
     VeltoHost::HostDevice::Ref device;
     std::shared_ptr<SimulatedHostDevice> simulated;
-    std::optional<PipelineRecording> recording;
+    // A simulated device's recording, read as it plays.
+    std::string recordingPath;
+    ToolFiles::File recording{nullptr, &std::fclose};
 };
 
-std::optional<Device> openDevice(const std::string& name)
+// Thrown from the recording's frame handler to end the playback.
+struct PlaybackStopped {};
+
+Device openDevice(const std::string& name)
 {
     Device device;
     if (name.rfind(kSimulatedPrefix, 0) == 0) {
-        const std::string path = name.substr(std::strlen(kSimulatedPrefix));
-        device.recording = ToolFiles::readRecordingUnlessStopped(path, &StopSignals::requested);
-        if (!device.recording) return std::nullopt;
+        device.recordingPath = name.substr(std::strlen(kSimulatedPrefix));
+        device.recording = ToolFiles::openRecording(device.recordingPath);
         device.simulated = SimulatedHostDevice::create();
         device.device = device.simulated;
         return device;
@@ -114,12 +118,7 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
     std::vector<std::pair<std::string, PropertyValue>> settings;
     for (const auto& [key, text] : options.settings) settings.emplace_back(key, StateArguments::parseValue(key, text));
 
-    std::optional<Device> device = openDevice(options.device);
-    if (!device) {
-        err << "veltotouch: stopped while loading " << options.device.substr(std::strlen(kSimulatedPrefix))
-            << std::endl;
-        return 0;
-    }
+    Device device = openDevice(options.device);
 
     HostEventSystem host;
     EventFormatter formatter(options.jsonLines, MonotonicClock::now());
@@ -128,7 +127,7 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
         std::lock_guard guard(outputLock);
         out << formatter.format(*event) << std::endl;
     });
-    host.start(plugin, kFactoryName, device->device);
+    host.start(plugin, kFactoryName, device.device);
 
     for (const auto& [key, value] : settings) {
         if (!host.setProperty(key, value)) {
@@ -139,18 +138,35 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
     }
 
     std::uint64_t discarded = 0;
-    if (device->simulated) {
+    std::string fault;
+    if (device.simulated) {
         VeltoHost::SimulatedDevicePlayer player(
-            device->simulated,
+            device.simulated,
             [&](const std::string& key, const PropertyValue& value) { host.setProperty(kPipelineDomain + key, value); },
             &StopSignals::requested, {options.speed, kMaxQueuedReports},
             VeltoHost::GapCap(options.maxGapSeconds,
                               [&](const std::string& note) { err << "veltotouch: note: " << note << std::endl; }));
-        for (const PipelineRecording::Frame& frame : device->recording->frames()) {
-            if (!player.play(frame)) break;
+        // Played as it is read, so that a recording of any length fits in memory.
+        bool played = false;
+        bool stopped = false;
+        try {
+            stopped = !ToolFiles::streamRecording(
+                device.recording.get(), device.recordingPath,
+                [&](PipelineRecording::Frame&& frame) {
+                    if (!player.play(frame)) throw PlaybackStopped{};
+                    played = true;
+                },
+                &StopSignals::requested);
+        } catch (const PlaybackStopped&) {
+            stopped = true;
+        } catch (const ToolError& error) {
+            // A fault further into the recording: what came before it is
+            // finished and reported as at the end, then the fault.
+            fault = error.what();
         }
+        if (stopped && !played) err << "veltotouch: stopped while loading " << device.recordingPath << std::endl;
         // Whatever the device was given, the plug-in takes before the end is read.
-        if (!device->simulated->waitUntilIdle(kFinishTimeout)) discarded = device->simulated->pendingReportCount();
+        if (!device.simulated->waitUntilIdle(kFinishTimeout)) discarded = device.simulated->pendingReportCount();
     } else {
         err << "veltotouch: reading " << options.device << "; press Ctrl-C to stop" << std::endl;
         while (!StopSignals::requested()) MonotonicClock::sleepMicroseconds(kWaitSliceMicroseconds);
@@ -179,6 +195,10 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
         ToolFiles::close(savedRecording, options.saveRecording);
     }
     host.stop();
+    if (!fault.empty()) {
+        err << "veltotouch: " << fault << '\n';
+        return 1;
+    }
     return 0;
 }
 

@@ -60,7 +60,7 @@ std::string describeUnreadable(const std::string& path, const std::string& text,
 std::string ToolFiles::read(const std::string& path)
 {
     if (isDirectory(path)) throw ToolError(path + ": is a directory");
-    return *readText(path, [] { return false; });
+    return readText(path);
 }
 
 void ToolFiles::write(const std::string& path, const std::string& text)
@@ -99,29 +99,13 @@ VeltoTouch::PipelineRecording ToolFiles::readRecording(const std::string& path)
     return recordingFromText(path, read(path));
 }
 
-std::optional<VeltoTouch::PipelineRecording> ToolFiles::readRecordingUnlessStopped(
-    const std::string& path, const std::function<bool()>& stopRequested)
-{
-    if (isDirectory(path)) throw ToolError(path + ": is a directory, " + std::string(kExpectedRecording));
-    std::optional<std::string> text = readText(path, stopRequested);
-    if (!text) return std::nullopt;
-    return recordingFromText(path, *text);
-}
-
-std::optional<std::string> ToolFiles::readText(const std::string& path, const std::function<bool()>& stopRequested)
+std::string ToolFiles::readText(const std::string& path)
 {
     const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
-    if (fd < 0) {
-        if (errno == EINTR && stopRequested()) return std::nullopt;
-        failWithErrno(path, "cannot open");
-    }
+    if (fd < 0) failWithErrno(path, "cannot open");
     std::string text;
     std::string chunk(kReadChunk, '\0');
     for (;;) {
-        if (stopRequested()) {
-            ::close(fd);
-            return std::nullopt;
-        }
         const ssize_t count = ::read(fd, chunk.data(), chunk.size());
         if (count == 0) break;
         if (count > 0) {
@@ -146,19 +130,28 @@ VeltoTouch::PipelineRecording ToolFiles::recordingFromText(const std::string& pa
     }
 }
 
-void ToolFiles::streamRecording(const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame)
+ToolFiles::File ToolFiles::openRecording(const std::string& path)
 {
     if (isDirectory(path)) throw ToolError(path + ": is a directory, " + std::string(kExpectedRecording));
     errno = 0;
-    std::FILE* file = std::fopen(path.c_str(), "rbe");
+    File file(std::fopen(path.c_str(), "rbe"), &std::fclose);
     if (!file) failWithErrno(path, "cannot open");
+    return file;
+}
+
+bool ToolFiles::streamRecording(std::FILE* file, const std::string& path,
+                                const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+                                const std::function<bool()>& stopRequested)
+{
+    // A stop that came before the first read must not wait for input that
+    // may never come (a pipe); one during a blocked read interrupts it.
+    if (stopRequested && stopRequested()) return false;
     try {
         VeltoTouch::ContainerStream::read(file, onFrame);
     } catch (const ToolError&) {
-        std::fclose(file);
         throw;
     } catch (const std::exception& error) {
-        std::fclose(file);
+        if (stopRequested && stopRequested()) return false;
         const std::string message = error.what();
         std::error_code sizeError;
         const std::uintmax_t size = std::filesystem::file_size(path, sizeError);
@@ -167,7 +160,13 @@ void ToolFiles::streamRecording(const std::string& path, const VeltoTouch::Conta
         }
         throw ToolError(describeUnreadable(path, read(path), message));
     }
-    std::fclose(file);
+    return !(stopRequested && stopRequested());
+}
+
+void ToolFiles::streamRecording(const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame)
+{
+    const File file = openRecording(path);
+    streamRecording(file.get(), path, onFrame);
 }
 
 }  // namespace VeltoTool

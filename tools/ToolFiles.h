@@ -3,7 +3,9 @@
 #include "recording/ContainerStream.h"
 #include "recording/PipelineRecording.h"
 
+#include <cstdio>
 #include <fstream>
+#include <memory>
 #include <functional>
 #include <optional>
 #include <string>
@@ -31,22 +33,26 @@ public:
     // JSON are told apart from a container with faults, whose own message is
     // kept.
     static VeltoTouch::PipelineRecording readRecording(const std::string& path);
-    // The same, read in pieces so that a stop request ends it at once, also
-    // when a read is blocked (a pipe, a stalled disk: the stop's signal
-    // interrupts it). Empty when stopped.
-    static std::optional<VeltoTouch::PipelineRecording> readRecordingUnlessStopped(
-        const std::string& path, const std::function<bool()>& stopRequested);
 
-    // The recording at `path` read as it arrives, each frame handed over as
-    // soon as it is complete (ContainerStream), so that its length does not
-    // matter. Failures as readRecording's, raised where they are reached: the
-    // frames before a fault have been handed over.
+    // A recording file opened for streamRecording, so that a path that cannot
+    // be read is refused before anything starts.
+    using File = std::unique_ptr<std::FILE, int (*)(std::FILE*)>;
+    static File openRecording(const std::string& path);
+
+    // The recording read as it arrives, each frame handed over as soon as it
+    // is complete (ContainerStream), so that its length does not matter.
+    // Failures as readRecording's, raised where they are reached: the frames
+    // before a fault have been handed over. Returns false when the read ended
+    // because a stop was requested (a signal that interrupts a blocked read
+    // cuts the input short).
+    static bool streamRecording(std::FILE* file, const std::string& path,
+                                const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+                                const std::function<bool()>& stopRequested = {});
     static void streamRecording(const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame);
 
 private:
-    // The whole file in pieces, so that a stop request (or the signal behind
-    // it interrupting a blocked read) ends it; empty when stopped.
-    static std::optional<std::string> readText(const std::string& path, const std::function<bool()>& stopRequested);
+    // The whole file, read in pieces (a read interrupted by a signal goes on).
+    static std::string readText(const std::string& path);
     static VeltoTouch::PipelineRecording recordingFromText(const std::string& path, const std::string& text);
 };
 

@@ -123,6 +123,28 @@ TEST(ReplayCommand, RecordingsThatCannotBeReadAreNamedWithWhatWasFoundInstead)
     }
 }
 
+TEST(ReplayCommand, AFaultAfterGoodFramesIsReportedAfterTheirEventsAlsoWhenHosted)
+{
+    // taps.json with a faulty frame in place of its closing: read as it
+    // arrives, every event before the fault is out before the error.
+    TempDir dir;
+    std::string text = readFile(kExamples + "/taps.json");
+    text.resize(text.rfind(']'));
+    text += R"(, {"Type": "Gesture", "Timestamp": 1}]})";
+    const fs::path file = dir.file("faulty.json", text);
+    const std::vector<std::string> expected = eventsOf(runTool({"replay", kExamples + "/taps.json", "--jsonl"}).out);
+    ASSERT_FALSE(expected.empty());
+    for (const std::vector<std::string>& arguments :
+         {std::vector<std::string>{"replay", file.string(), "--jsonl"},
+          std::vector<std::string>{"host", "--device", "sim:" + file.string(), "--speed", "0", "--jsonl"}}) {
+        SCOPED_TRACE(arguments[0]);
+        const ToolRun run = runTool(arguments);
+        EXPECT_EQ(run.status, 1);
+        EXPECT_EQ(run.err, "veltotouch: " + file.string() + ": invalid frame type\n");
+        EXPECT_EQ(eventsOf(run.out), expected);
+    }
+}
+
 TEST(ReplayCommand, JsonLinesWithDumpsAreJsonOnEveryLine)
 {
     const std::string file = kExamples + "/taps.json";
