@@ -143,11 +143,9 @@ bool ToolFiles::streamRecording(std::FILE* file, const std::string& path,
                                 const VeltoTouch::ContainerStream::FrameHandler& onFrame,
                                 const std::function<bool()>& stopRequested)
 {
-    // A stop that came before the first read must not wait for input that
-    // may never come (a pipe); one during a blocked read interrupts it.
-    if (stopRequested && stopRequested()) return false;
     try {
-        VeltoTouch::ContainerStream::read(file, onFrame);
+        // Read through the descriptor: stdio's buffer is never used.
+        VeltoTouch::ContainerStream::read(::fileno(file), onFrame, stopRequested);
     } catch (const ToolError&) {
         throw;
     } catch (const std::exception& error) {

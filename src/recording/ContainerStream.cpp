@@ -3,10 +3,13 @@
 #include "recording/ContainerFrames.h"
 #include "recording/PropertyValueBuilder.h"
 
-#include <rapidjson/filereadstream.h>
 #include <rapidjson/reader.h>
 
+#include <cerrno>
 #include <cstring>
+#include <vector>
+#include <poll.h>
+#include <unistd.h>
 #include <exception>
 #include <optional>
 #include <stdexcept>
@@ -30,6 +33,85 @@ constexpr std::size_t kReadBufferBytes = 1 << 16;
 
 // Raised when the frames come before the version: the file must be read whole.
 struct FramesBeforeVersion {};
+
+// RapidJSON's input from a file descriptor, read in pieces as the parser
+// needs them. Waiting for input (a pipe) is done in poll() with a short
+// timeout, so that a stop request is seen even when it came just before a
+// read that would block for ever; a stop or a read error ends the input as
+// its end would (the caller tells which).
+class DescriptorInput {
+public:
+    using Ch = char;
+
+    DescriptorInput(int fd, const std::function<bool()>& stopRequested)
+        : _fd(fd), _stopRequested(stopRequested), _buffer(kReadBufferBytes)
+    {
+        refill();
+    }
+
+    Ch Peek() const { return *_current; }
+    Ch Take()
+    {
+        const Ch c = *_current;
+        if (_current < _last) {
+            ++_current;
+        } else {
+            refill();
+        }
+        return c;
+    }
+    std::size_t Tell() const { return _consumed + static_cast<std::size_t>(_current - _buffer.data()); }
+    // The first bytes, when there are four (a byte order mark is looked for).
+    const Ch* Peek4() const { return _current + 4 <= _last ? _current : nullptr; }
+
+    // Output is never asked of an input stream.
+    void Put(Ch) {}
+    void Flush() {}
+    Ch* PutBegin() { return nullptr; }
+    std::size_t PutEnd(Ch*) { return 0; }
+
+private:
+    static constexpr int kStopPollMilliseconds = 100;
+
+    void refill()
+    {
+        if (_ended) return;  // stays on the terminating '\0'
+        _consumed += _filled;
+        const ssize_t count = readSome();
+        _current = _buffer.data();
+        if (count <= 0) {
+            _buffer[0] = '\0';
+            _last = _current;
+            _filled = 0;
+            _ended = true;
+            return;
+        }
+        _filled = static_cast<std::size_t>(count);
+        _last = _current + count - 1;
+    }
+
+    ssize_t readSome()
+    {
+        for (;;) {
+            if (_stopRequested && _stopRequested()) return -1;
+            pollfd ready{_fd, POLLIN, 0};
+            const int polled = ::poll(&ready, 1, kStopPollMilliseconds);
+            if (polled == 0 || (polled < 0 && errno == EINTR)) continue;
+            const ssize_t count = ::read(_fd, _buffer.data(), _buffer.size());
+            if (count < 0 && errno == EINTR) continue;
+            return count;
+        }
+    }
+
+    int _fd;
+    const std::function<bool()>& _stopRequested;
+    std::vector<Ch> _buffer;
+    Ch* _current = nullptr;
+    Ch* _last = nullptr;
+    std::size_t _filled = 0;
+    std::size_t _consumed = 0;
+    bool _ended = false;
+};
 
 // Whether text is well-formed UTF-8 (no overlong forms, no surrogates,
 // nothing past U+10FFFF), as the whole-text reader requires of strings.
@@ -408,11 +490,10 @@ private:
 
 }  // namespace
 
-void ContainerStream::read(std::FILE* file, const FrameHandler& onFrame)
+void ContainerStream::read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested)
 {
-    const long start = std::ftell(file);
-    char buffer[kReadBufferBytes];
-    rapidjson::FileReadStream input(file, buffer, sizeof buffer);
+    const off_t start = ::lseek(fd, 0, SEEK_CUR);
+    DescriptorInput input(fd, stopRequested);
     // A byte order mark is skipped, as the whole-text reader skips it.
     if (const char* first = input.Peek4(); first && std::memcmp(first, "\xEF\xBB\xBF", 3) == 0) {
         for (int i = 0; i < 3; ++i) input.Take();
@@ -436,12 +517,18 @@ void ContainerStream::read(std::FILE* file, const FrameHandler& onFrame)
     if (!framesBeforeVersion) return;
 
     // Read whole, from the start, when the file can be read again.
-    if (start < 0 || std::fseek(file, start, SEEK_SET) != 0) {
+    if (start < 0 || ::lseek(fd, start, SEEK_SET) != start) {
         throw std::runtime_error("the container gives its frames before its \"Version\", and this input cannot "
                                  "be read again to take them in that order");
     }
     std::string text;
-    for (std::size_t count; (count = std::fread(buffer, 1, sizeof buffer, file)) > 0;) text.append(buffer, count);
+    std::vector<char> buffer(kReadBufferBytes);
+    for (;;) {
+        const ssize_t count = ::read(fd, buffer.data(), buffer.size());
+        if (count < 0 && errno == EINTR) continue;
+        if (count <= 0) break;
+        text.append(buffer.data(), static_cast<std::size_t>(count));
+    }
     PipelineRecording recording{std::string_view(text)};
     text.clear();
     text.shrink_to_fit();

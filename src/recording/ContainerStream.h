@@ -2,7 +2,6 @@
 
 #include "recording/PipelineRecording.h"
 
-#include <cstdio>
 #include <functional>
 
 namespace VeltoTouch {
@@ -29,8 +28,11 @@ public:
     // exception reaches the caller of read()).
     using FrameHandler = std::function<void(PipelineRecording::Frame&& frame)>;
 
-    // Reads from the file's current position to its end. The file stays open.
-    static void read(std::FILE* file, const FrameHandler& onFrame);
+    // Reads from the descriptor's current position to its end; it stays
+    // open. When `stopRequested` turns true, the input ends there as if it
+    // had been cut short (the caller, who asked, tells a stop from a fault),
+    // also while waiting for input that has not come (a pipe).
+    static void read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested = {});
 };
 
 }  // namespace VeltoTouch

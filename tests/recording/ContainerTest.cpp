@@ -7,7 +7,10 @@
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
+#include <atomic>
+#include <chrono>
 #include <cmath>
+#include <thread>
 #include <cstdio>
 #include <unistd.h>
 #include <limits>
@@ -25,11 +28,13 @@ using VeltoTouch::JsonValue;
 // file in memory (seekable, like a file on disk).
 PipelineRecording::FrameList streamFrames(const std::string& text, std::size_t* handedBeforeFault = nullptr)
 {
-    std::FILE* file = ::fmemopen(const_cast<char*>(text.data()), text.size(), "r");
-    if (text.empty()) file = std::tmpfile();  // fmemopen refuses a size of 0
+    std::FILE* file = std::tmpfile();
+    std::fwrite(text.data(), 1, text.size(), file);
+    std::fflush(file);
+    ::lseek(::fileno(file), 0, SEEK_SET);
     PipelineRecording::FrameList frames;
     try {
-        VeltoTouch::ContainerStream::read(file, [&](Frame&& frame) { frames.push_back(std::move(frame)); });
+        VeltoTouch::ContainerStream::read(::fileno(file), [&](Frame&& frame) { frames.push_back(std::move(frame)); });
     } catch (...) {
         std::fclose(file);
         if (handedBeforeFault) *handedBeforeFault = frames.size();
@@ -149,14 +154,34 @@ TEST(RecordingContainer, AStreamedContainerHandsOverWhatTheWholeTextReaderReads)
     const std::string early = R"({"Frames": [], "Version": 1})";
     ASSERT_EQ(::write(ends[1], early.data(), early.size()), static_cast<ssize_t>(early.size()));
     ::close(ends[1]);
-    std::FILE* pipe = ::fdopen(ends[0], "r");
     try {
-        VeltoTouch::ContainerStream::read(pipe, [](Frame&&) {});
+        VeltoTouch::ContainerStream::read(ends[0], [](Frame&&) {});
         ADD_FAILURE() << "frames before the version were taken from a pipe";
     } catch (const std::runtime_error& error) {
         EXPECT_NE(std::string(error.what()).find("before its \"Version\""), std::string::npos) << error.what();
     }
-    std::fclose(pipe);
+    ::close(ends[0]);
+
+    // A stop ends a read that waits for input that never comes, whenever it
+    // comes: before the read, or while it waits.
+    for (const bool stopFirst : {true, false}) {
+        ASSERT_EQ(::pipe(ends), 0);
+        const std::string start = R"({"Version": 1, "Frames": [{)" + report + "}, ";
+        ASSERT_EQ(::write(ends[1], start.data(), start.size()), static_cast<ssize_t>(start.size()));
+        std::atomic<bool> stop{stopFirst};
+        std::thread stopper([&] {
+            std::this_thread::sleep_for(std::chrono::milliseconds(50));
+            stop = true;
+        });
+        handed = 0;
+        EXPECT_THROW(VeltoTouch::ContainerStream::read(
+                         ends[0], [&](Frame&&) { ++handed; }, [&] { return stop.load(); }),
+                     std::runtime_error);
+        stopper.join();
+        EXPECT_EQ(handed, stopFirst ? 0u : 1u);
+        ::close(ends[0]);
+        ::close(ends[1]);
+    }
 }
 
 TEST(RecordingContainer, ValuesJsonCannotHoldAreWrittenWithoutFailing)
