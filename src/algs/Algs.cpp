@@ -6,6 +6,7 @@
 #include <cstdarg>
 #include <cstdio>
 #include <sstream>
+#include <tuple>
 #include <utility>
 
 namespace VeltoTouch {
@@ -120,6 +121,7 @@ void Algs::processTouchFrame(const Readings& readings, unsigned int frameNumber,
     if (decision.event) emitEvent(decision.event, frameNumber, events);
 
     eventStats.update(handStats);
+    if (decisionObserver) decisionObserver->frameDecided(decisionRecord(readings, frameNumber, timeMs, decision.event));
     if (log.isEnabled(LogLevel::Debug)) writeDumps(readings, frameNumber, timeMs);
 }
 
@@ -267,37 +269,89 @@ std::string Algs::virtualStateDescription(const Readings& /*readings*/, unsigned
     return text;
 }
 
-// One word for the phase of the touch in this frame; the first row that holds decides.
-std::string Algs::stateText(unsigned int timeMs) const
+// The phase of the touch in this frame; the first row that holds decides.
+std::pair<TouchPhase, std::int32_t> Algs::touchPhase(unsigned int timeMs) const
 {
     const HandStats& hand = handStats;
     // Differences wrap in 32 bits and print as signed numbers.
     const auto sinceStart = static_cast<std::int32_t>(timeMs - hand.touchStartTime);
     const auto duration = static_cast<std::int32_t>(hand.touchEndTime - hand.touchStartTime);
-    const int region = static_cast<int>(hand.activeRegion);
-    const char* noise = hand.aboveNoise ? "ABOVENOISE" : "BELOWNOISE";
+
+    if (hand.touching && !hand.wasTouching) return {TouchPhase::StartTouch, sinceStart};
+    if (hand.holding && hand.wasHolding) return {TouchPhase::Holding, sinceStart};
+    if (hand.holding) return {TouchPhase::StartHold, sinceStart};
+    if (hand.holdSuppressed) return {TouchPhase::SuppressHold, sinceStart};
+    if (hand.touching) return {TouchPhase::Touching, sinceStart};
+    if (hand.wasHolding) return {TouchPhase::EndHold, duration};
+    if (hand.tapAccepted) return {TouchPhase::Tap, duration};
+    if (hand.tapCandidate) return {TouchPhase::SuppressTap, sinceStart};
+    if (hand.wasTouching) return {TouchPhase::EndTouch, duration};
+    return {TouchPhase::Idle, 0};
+}
+
+// One word for the phase of the touch in this frame, its time and region,
+// and at a release whether anything is still above noise.
+std::string Algs::stateText(unsigned int timeMs) const
+{
+    const auto [phase, ms] = touchPhase(timeMs);
+    const int region = static_cast<int>(handStats.activeRegion);
+    const char* noise = handStats.aboveNoise ? "ABOVENOISE" : "BELOWNOISE";
 
     std::string text;
-    if (hand.touching && !hand.wasTouching) {
-        appendFormat(text, "STARTTOUCH %dms ActiveRegion=%d", sinceStart, region);
-    } else if (hand.holding && hand.wasHolding) {
-        appendFormat(text, "HOLDING %dms ActiveRegion=%d", sinceStart, region);
-    } else if (hand.holding) {
-        appendFormat(text, "STARTHOLD %dms ActiveRegion=%d", sinceStart, region);
-    } else if (hand.holdSuppressed) {
-        appendFormat(text, "SUPPRESSHOLD %dms ActiveRegion=%d", sinceStart, region);
-    } else if (hand.touching) {
-        appendFormat(text, "TOUCHING %dms ActiveRegion=%d", sinceStart, region);
-    } else if (hand.wasHolding) {
-        appendFormat(text, "ENDHOLD %dms ActiveRegion=%d %s", duration, region, noise);
-    } else if (hand.tapAccepted) {
-        appendFormat(text, "TAP %dms ActiveRegion=%d %s", duration, region, noise);
-    } else if (hand.tapCandidate) {
-        appendFormat(text, "SUPPRESSTAP %dms ActiveRegion=%d %s", sinceStart, region, noise);
-    } else if (hand.wasTouching) {
-        appendFormat(text, "ENDTOUCH %dms ActiveRegion=%d %s", duration, region, noise);
+    switch (phase) {
+    case TouchPhase::Idle: break;
+    case TouchPhase::StartTouch: appendFormat(text, "STARTTOUCH %dms ActiveRegion=%d", ms, region); break;
+    case TouchPhase::Holding: appendFormat(text, "HOLDING %dms ActiveRegion=%d", ms, region); break;
+    case TouchPhase::StartHold: appendFormat(text, "STARTHOLD %dms ActiveRegion=%d", ms, region); break;
+    case TouchPhase::SuppressHold: appendFormat(text, "SUPPRESSHOLD %dms ActiveRegion=%d", ms, region); break;
+    case TouchPhase::Touching: appendFormat(text, "TOUCHING %dms ActiveRegion=%d", ms, region); break;
+    case TouchPhase::EndHold: appendFormat(text, "ENDHOLD %dms ActiveRegion=%d %s", ms, region, noise); break;
+    case TouchPhase::Tap: appendFormat(text, "TAP %dms ActiveRegion=%d %s", ms, region, noise); break;
+    case TouchPhase::SuppressTap: appendFormat(text, "SUPPRESSTAP %dms ActiveRegion=%d %s", ms, region, noise); break;
+    case TouchPhase::EndTouch: appendFormat(text, "ENDTOUCH %dms ActiveRegion=%d %s", ms, region, noise); break;
     }
     return text;
+}
+
+DecisionRecord Algs::decisionRecord(const Readings& readings, unsigned int frameNumber, unsigned int timeMs,
+                                    const HidEventRef& event) const
+{
+    const HandStats& hand = handStats;
+    DecisionRecord record;
+    record.frameNumber = frameNumber;
+    record.timeMs = timeMs;
+    record.readings = readings;
+    for (std::size_t pad = 0; pad < DecisionRecord::kPadCount; ++pad) {
+        const Pixel& pixel = pixels.at(pad);
+        record.levels[pad] = pixel.value;
+        if (pixel.active) record.activePads |= static_cast<std::uint16_t>(1u << pad);
+    }
+    for (std::size_t group = 0; group < DecisionRecord::kVirtualCount; ++group) {
+        const VirtualPixel& pixel = virtualPixels.at(group);
+        record.virtualLevels[group] = pixel.value;
+        if (pixel.active) record.activeVirtualPixels |= 1u << group;
+    }
+    record.svmScore = hand.svm.score;
+    record.touchScore = hand.touchScore;
+    record.activeRegion = hand.activeRegion;
+    record.regionScores = hand.regionMax;
+    record.signalPerDuration = hand.signalPerDuration;
+    record.signalPerTouchDuration = hand.signalPerTouchDuration;
+    record.timeDurationRatio = hand.timeDurationRatio;
+    record.nonActivePixels = hand.nonActivePixels;
+    record.tapScore = hand.tapSVMScore;
+    record.tapRejected = hand.tapRejected;
+    record.touching = hand.touching;
+    record.wasTouching = hand.wasTouching;
+    record.aboveNoise = hand.aboveNoise;
+    record.holding = hand.holding;
+    record.wasHolding = hand.wasHolding;
+    record.holdSuppressed = hand.holdSuppressed;
+    record.tapCandidate = hand.tapCandidate;
+    record.tapAccepted = hand.tapAccepted;
+    std::tie(record.phase, record.phaseMs) = touchPhase(timeMs);
+    record.event = event;
+    return record;
 }
 
 HidEventRef Algs::createMayBeginEvent(PixelRegion region)

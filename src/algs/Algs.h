@@ -1,9 +1,12 @@
 #pragma once
 
+#include "algs/DecisionObserver.h"
+#include "algs/DecisionRecord.h"
 #include "algs/EventStats.h"
 #include "algs/HandStats.h"
 #include "algs/Pixel.h"
 #include "algs/PixelRegion.h"
+#include "algs/TouchPhase.h"
 #include "algs/VirtualImage.h"
 #include "algs/VirtualPixel.h"
 #include "pipeline/InputReport.h"
@@ -14,6 +17,7 @@
 #include <array>
 #include <cstdint>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace VeltoTouch {
@@ -58,6 +62,8 @@ public:
     HandStats handStats;
     EventStats eventStats;
     std::uint16_t lastEventPhase = 0;
+    // Told about every frame when set; not owned.
+    DecisionObserver* decisionObserver = nullptr;
 
 private:
     // What the event decision table says for one frame.
@@ -72,6 +78,10 @@ private:
     void emitEvent(const VeltoHost::HidEventRef& event, unsigned int frameNumber, VeltoHost::HidEventList& events);
     void writeDumps(const Readings& readings, unsigned int frameNumber, unsigned int timeMs) const;
 
+    DecisionRecord decisionRecord(const Readings& readings, unsigned int frameNumber, unsigned int timeMs,
+                                  const VeltoHost::HidEventRef& event) const;
+    // The phase word of this frame and the milliseconds printed with it.
+    std::pair<TouchPhase, std::int32_t> touchPhase(unsigned int timeMs) const;
     std::string stateText(unsigned int timeMs) const;
     std::string handFeaturesText() const;
 };

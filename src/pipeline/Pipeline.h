@@ -41,6 +41,8 @@ public:
 
     // The recogniser, for diagnostics that need more than its state keys.
     const Algs& algs() const noexcept { return _algs; }
+    // Receives the recogniser's record of every frame from now on; nullptr stops it.
+    void setDecisionObserver(DecisionObserver* observer) noexcept { _algs.decisionObserver = observer; }
 
 private:
     void handleFirmwareEvent(const InputReport::FirmwareEvent& event);
