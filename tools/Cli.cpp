@@ -6,6 +6,7 @@
 #include "FiniteNumberCheck.h"
 #include "HostCommand.h"
 #include "ReplayCommand.h"
+#include "ReportCommand.h"
 #include "StateArguments.h"
 #include "SynthCommand.h"
 #include "ToolError.h"
@@ -196,6 +197,16 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     ctlAction("save-recording", "Write a device's recording to a file", CtlCommand::Action::SaveRecording)
         ->add_option("OUT", ctl.output, "File to write (as the daemon's user)")
         ->required();
+    ReportCommand::Options report;
+    std::vector<std::string> reportSets;
+    auto* reportCommand = app.add_subcommand("report", "Replay a recording into a self-contained HTML page");
+    reportCommand->add_option("FILE", report.file, "Recording container (JSON)")->required();
+    reportCommand->add_option("-o,--output", report.output, "HTML page to write")->required();
+    reportCommand->add_option("--set", reportSets, "KEY=VALUE: pipeline state before the first frame (VALUE is JSON)")
+        ->check(settingCheck());
+    reportCommand->add_option("--frames", report.frames, "A:B, inclusive range of frame numbers to show")
+        ->check(argumentCheck("A:B", [](const std::string& text) { DumpCommand::parseRange(text); }));
+    reportCommand->add_option("--title", report.title, "Title of the page (default: the recording's file name)");
 
     std::string helpTopic;
     auto* helpCommand = app.add_subcommand("help", "Describe the commands, or one COMMAND and its options");
@@ -242,6 +253,9 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             SynthCommand::run(synth);
         } else if (*dumpCommand) {
             DumpCommand::run(dump, out);
+        } else if (*reportCommand) {
+            report.settings = splitAll(reportSets);
+            ReportCommand::run(report, err);
         } else if (*hostCommand) {
             host.settings = splitAll(hostSets);
             return HostCommand::run(host, out, err);

@@ -17,27 +17,10 @@ namespace VeltoTool {
 using VeltoTouch::Pipeline;
 using VeltoTouch::PipelineRecording;
 
-namespace {
-
-// Each setting is read back at once, so that one the pipeline converted
-// (a string stored as 0) is reported before it skews the whole replay.
-void applySettings(Pipeline& pipeline, const ReplayCommand::Options& options, std::ostream& err)
-{
-    for (const auto& [key, valueText] : options.settings) {
-        const VeltoHost::PropertyValue value = StateArguments::parseValue(key, valueText);
-        pipeline.setState(key, value);
-        if (auto warning = StateArguments::readBackWarning(key, value, pipeline.getState(key))) {
-            err << "veltotouch: warning: " << *warning << '\n';
-        }
-    }
-}
-
-}  // namespace
-
 void ReplayCommand::run(const Options& options, std::ostream& out, std::ostream& err)
 {
     auto pipeline = std::make_shared<Pipeline>();
-    applySettings(*pipeline, options, err);
+    StateArguments::apply(*pipeline, options.settings, err);
 
     // The first time the playback sets is its start; readable lines count from there.
     EventFormatter formatter(options.jsonLines);

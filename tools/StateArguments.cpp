@@ -83,4 +83,16 @@ std::optional<std::string> StateArguments::readBackWarning(const std::string& ke
     return key + " was set to " + written.description() + " but reads back " + readBack.description();
 }
 
+void StateArguments::apply(VeltoTouch::Pipeline& pipeline,
+                           const std::vector<std::pair<std::string, std::string>>& settings, std::ostream& err)
+{
+    for (const auto& [key, valueText] : settings) {
+        const VeltoHost::PropertyValue value = parseValue(key, valueText);
+        pipeline.setState(key, value);
+        if (auto warning = readBackWarning(key, value, pipeline.getState(key))) {
+            err << "veltotouch: warning: " << *warning << '\n';
+        }
+    }
+}
+
 }  // namespace VeltoTool

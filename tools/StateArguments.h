@@ -1,10 +1,13 @@
 #pragma once
 
+#include "pipeline/Pipeline.h"
 #include "platform/PropertyValue.h"
 
 #include <optional>
+#include <ostream>
 #include <string>
 #include <utility>
+#include <vector>
 
 namespace VeltoTool {
 
@@ -30,6 +33,12 @@ public:
     // "warning:" prefix.
     static std::optional<std::string> readBackWarning(const std::string& key, const VeltoHost::PropertyValue& written,
                                                       const VeltoHost::PropertyValue& readBack);
+
+    // Writes each KEY=JSON setting into the pipeline and reads it back at
+    // once, so that one the pipeline converted (a string stored as 0) is
+    // reported on `err` before it skews a whole replay.
+    static void apply(VeltoTouch::Pipeline& pipeline, const std::vector<std::pair<std::string, std::string>>& settings,
+                      std::ostream& err);
 };
 
 }  // namespace VeltoTool

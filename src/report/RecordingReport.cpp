@@ -1,0 +1,184 @@
+#include "report/RecordingReport.h"
+
+#include "recording/JsonValue.h"
+#include "report/ReportTemplate.h"
+
+#include <nlohmann/json.hpp>
+
+#include <stdexcept>
+
+namespace VeltoTouch {
+
+namespace {
+
+// Reads a container's top-level "Version" without building the document:
+// stops as soon as the value is seen.
+class VersionScanner : public nlohmann::json_sax<nlohmann::json> {
+public:
+    std::optional<std::uint64_t> version;
+
+    bool null() override { return settle(std::nullopt); }
+    bool boolean(bool value) override { return settle(value ? 1 : 0); }
+    bool number_integer(number_integer_t value) override { return settle(static_cast<std::uint64_t>(value)); }
+    bool number_unsigned(number_unsigned_t value) override { return settle(value); }
+    bool number_float(number_float_t value, const string_t&) override
+    {
+        return settle(static_cast<std::uint64_t>(value));
+    }
+    bool string(string_t&) override { return settle(std::nullopt); }
+    bool binary(binary_t&) override { return settle(std::nullopt); }
+    bool start_object(std::size_t) override
+    {
+        _wanted = false;
+        ++_depth;
+        return true;
+    }
+    bool end_object() override
+    {
+        --_depth;
+        return true;
+    }
+    bool start_array(std::size_t) override
+    {
+        _wanted = false;
+        ++_depth;
+        return true;
+    }
+    bool end_array() override
+    {
+        --_depth;
+        return true;
+    }
+    bool key(string_t& name) override
+    {
+        _wanted = _depth == 1 && name == "Version";
+        return true;
+    }
+    bool parse_error(std::size_t, const std::string&, const nlohmann::detail::exception&) override { return false; }
+
+private:
+    // A scalar: the answer when it is the top level's "Version"; false stops the scan.
+    bool settle(std::optional<std::uint64_t> value)
+    {
+        if (!_wanted) return true;
+        version = value;
+        return false;
+    }
+
+    int _depth = 0;
+    bool _wanted = false;
+};
+
+void replaceAll(std::string& text, std::string_view from, std::string_view to)
+{
+    for (std::size_t at = text.find(from); at != std::string::npos; at = text.find(from, at + to.size())) {
+        text.replace(at, from.size(), to);
+    }
+}
+
+std::string htmlEscaped(std::string_view text)
+{
+    std::string out;
+    for (const char c : text) {
+        switch (c) {
+        case '&': out += "&amp;"; break;
+        case '<': out += "&lt;"; break;
+        case '>': out += "&gt;"; break;
+        case '"': out += "&quot;"; break;
+        default: out += c;
+        }
+    }
+    return out;
+}
+
+// Counters can pass 2^53, beyond what the page's numbers hold exactly, so
+// they travel as decimal text.
+nlohmann::ordered_json countersAsText(const nlohmann::ordered_json& stats)
+{
+    nlohmann::ordered_json out = nlohmann::ordered_json::object();
+    for (const auto& [group, counters] : stats.items()) {
+        out[group] = nlohmann::ordered_json::object();
+        for (const auto& [name, value] : counters.items()) out[group][name] = value.dump();
+    }
+    return out;
+}
+
+nlohmann::ordered_json facts(const PipelineRecording& recording, const RecordingReport::Options& options,
+                             std::size_t pageFrames)
+{
+    std::uint64_t reports = 0;
+    std::uint64_t states = 0;
+    std::optional<std::uint64_t> first;
+    std::uint64_t last = 0;
+    for (const PipelineRecording::Frame& frame : recording.frames()) {
+        if (frame.type == PipelineRecording::Frame::Type::InputReport) ++reports;
+        if (frame.type == PipelineRecording::Frame::Type::State) ++states;
+        if (!first) first = frame.timestampNs;
+        last = frame.timestampNs;
+    }
+    nlohmann::ordered_json out;
+    out["source"] = options.source;
+    out["frames"] = recording.frames().size();
+    out["reports"] = reports;
+    out["stateFrames"] = states;
+    out["pageFrames"] = pageFrames;
+    // Nanosecond time stamps pass 2^53 too.
+    out["durationNs"] = first && last >= *first ? std::to_string(last - *first) : "0";
+    out["containerVersion"] = options.containerVersion ? std::to_string(*options.containerVersion) : "unknown";
+    out["firstTimestampNs"] = first ? std::to_string(*first) : "";
+    out["lastTimestampNs"] = first ? std::to_string(last) : "";
+    nlohmann::ordered_json settings = nlohmann::ordered_json::array();
+    for (const auto& [key, value] : options.settings) settings.push_back({key, value});
+    out["settings"] = std::move(settings);
+    std::string range;
+    if (options.frames.first || options.frames.last) {
+        range = (options.frames.first ? std::to_string(*options.frames.first) : "") + ":" +
+                (options.frames.last ? std::to_string(*options.frames.last) : "");
+    }
+    out["frameRange"] = range;
+    return out;
+}
+
+}  // namespace
+
+std::optional<std::uint64_t> RecordingReport::containerVersion(std::string_view containerText)
+{
+    VersionScanner scanner;
+    nlohmann::json::sax_parse(containerText, &scanner);
+    return scanner.version;
+}
+
+std::string RecordingReport::html(PipelineRecording& recording, const std::shared_ptr<Pipeline>& pipeline,
+                                  const Options& options)
+{
+    nlohmann::ordered_json payload;
+    {
+        ReportCollector collector(*pipeline, options.frames);
+        recording.pipeline = pipeline;
+        recording.sleepMicroseconds = [](std::uint64_t) {};
+        recording.playReset();
+        while (recording.playCanContinue()) recording.playNextFrame(1.0f);
+        recording.pipeline = nullptr;
+        payload = collector.payload();
+        payload["facts"] = facts(recording, options, collector.frameCount());
+    }
+    payload["title"] = options.title;
+    payload["counters"] = countersAsText(JsonValue::toJson(pipeline->getState("Algs.EventStats")));
+
+    // Inside the data's script element "<" only ever stands in a string, where
+    // \u003c reads back the same and "</script>" can no longer end it early.
+    std::string data = JsonValue::dump(payload, false);
+    replaceAll(data, "<", "\\u003c");
+
+    std::string page(ReportTemplate::kHtml);
+    // The data goes in last: the other texts then cannot be matched inside it.
+    replaceAll(page, "{{title}}", htmlEscaped(options.title));
+    replaceAll(page, "/*{{style}}*/", ReportTemplate::kStyle);
+    replaceAll(page, "/*{{script}}*/", ReportTemplate::kScript);
+    const std::size_t at = page.find("{{data}}");
+    if (at == std::string::npos) throw std::logic_error("report page template has no data slot");
+    page.replace(at, std::string_view("{{data}}").size(), data);
+    return page;
+}
+
+}  // namespace VeltoTouch

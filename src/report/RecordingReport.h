@@ -1,0 +1,44 @@
+#pragma once
+
+#include "pipeline/Pipeline.h"
+#include "recording/PipelineRecording.h"
+#include "report/ReportCollector.h"
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+namespace VeltoTouch {
+
+// A recording replayed into one self-contained HTML page: the pads' readings
+// as a heat map, the recogniser's scores and region per frame, the gestures,
+// resets, state writes and frame gaps on the same time axis, the counters at
+// the end and the recording's facts. Everything the page needs is inside the
+// file; it loads nothing else.
+class RecordingReport {
+public:
+    struct Options {
+        std::string title;
+        // Shown among the facts: where the recording came from, the version
+        // of its container, and the settings applied before the first frame.
+        std::string source;
+        std::optional<std::uint64_t> containerVersion;
+        std::vector<std::pair<std::string, std::string>> settings;
+        ReportCollector::FrameRange frames;
+    };
+
+    // Plays every frame of `recording` through `pipeline` (already set up by
+    // the caller) as fast as possible and returns the page.
+    static std::string html(PipelineRecording& recording, const std::shared_ptr<Pipeline>& pipeline,
+                            const Options& options);
+
+    // The "Version" of a container's text, as its top level states it; empty
+    // when the text has none.
+    static std::optional<std::uint64_t> containerVersion(std::string_view containerText);
+};
+
+}  // namespace VeltoTouch
