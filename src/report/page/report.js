@@ -22,7 +22,9 @@
     { id: 'heat', label: 'pads', height: 15 * 11 },
     { id: 'svm', label: 'SVM score', height: 64, column: 'svm' },
     { id: 'touch', label: 'touch score', height: 64, column: 'touch' },
-    { id: 'tap', label: 'tap score', height: 64, column: 'tap' },
+    // The tap score runs into the millions for touches shorter than a frame;
+    // a logarithmic scale keeps the sign change at 0 visible.
+    { id: 'tap', label: 'tap score (log scale)', height: 64, column: 'tap', log: true },
     { id: 'region', label: 'region', height: 16 },
     { id: 'events', label: 'events', height: 58 },
     { id: 'axis', label: '', height: 22 },
@@ -111,11 +113,15 @@
   const fullEnd = frameCount ? col.t[frameCount - 1] + period : 1000000;
   const minSpan = Math.max(period * 8, 1000);
 
-  function extent(values) {
+  const identity = (v) => v;
+  const symlog = (v) => Math.sign(v) * Math.log10(1 + Math.abs(v));
+  const unsymlog = (v) => Math.sign(v) * (Math.pow(10, Math.abs(v)) - 1);
+
+  function extent(values, transform) {
     let low = 0;
     let high = 0;
     for (let i = 0; i < values.length; i++) {
-      const v = values[i];
+      const v = transform(values[i]);
       if (!Number.isFinite(v)) continue;
       if (v < low) low = v;
       if (v > high) high = v;
@@ -123,7 +129,7 @@
     if (high === low) high = low + 1;
     return [low, high];
   }
-  const ranges = { svm: extent(col.svm), touch: extent(col.touch), tap: extent(col.tap) };
+  const ranges = { svm: extent(col.svm, identity), touch: extent(col.touch, identity), tap: extent(col.tap, symlog) };
 
   function heatScale(columns) {
     let high = 1;
@@ -265,9 +271,10 @@
     for (let pad = 0; pad < PAD_COUNT; pad++) context.fillText(PAD_LETTERS[pad], MARGIN_LEFT - 6, top + (pad + 0.5) * row);
   }
 
-  function drawLine(context, spans, columns, values, range, top, height) {
+  function drawLine(context, spans, columns, values, range, log, top, height) {
     const [low, high] = range;
-    const y = (v) => top + height - (Math.min(Math.max(v, low), high) - low) / (high - low) * height;
+    const transform = log ? symlog : identity;
+    const y = (v) => top + height - (Math.min(Math.max(transform(v), low), high) - low) / (high - low) * height;
     const step = plotWidth() / columns;
     context.strokeStyle = '#d5dbe1';
     context.lineWidth = 1;
@@ -302,9 +309,10 @@
     context.font = '10px system-ui, sans-serif';
     context.textAlign = 'right';
     context.textBaseline = 'top';
-    context.fillText(formatNumber(high), MARGIN_LEFT - 6, top);
+    const label = log ? unsymlog : identity;
+    context.fillText(formatNumber(label(high)), MARGIN_LEFT - 6, top);
     context.textBaseline = 'bottom';
-    context.fillText(formatNumber(low), MARGIN_LEFT - 6, top + height);
+    context.fillText(formatNumber(label(low)), MARGIN_LEFT - 6, top + height);
   }
 
   function drawRegion(context, spans, columns, top, height) {
@@ -475,7 +483,7 @@
     drawHeat(context, spans, columns, laneTop('heat'), LANES[0].height);
     for (const lane of LANES) {
       if (!lane.column) continue;
-      drawLine(context, spans, columns, col[lane.column], ranges[lane.column], laneTop(lane.id), lane.height);
+      drawLine(context, spans, columns, col[lane.column], ranges[lane.column], lane.log, laneTop(lane.id), lane.height);
     }
     drawRegion(context, spans, columns, laneTop('region'), LANES[4].height);
     drawEvents(context, laneTop('events'), LANES[5].height);
@@ -548,6 +556,7 @@
   // ---- text -------------------------------------------------------------------
 
   function formatNumber(v) {
+    if (Math.abs(v) >= 1e5) return v.toExponential(1);
     if (Math.abs(v) >= 1000) return v.toFixed(0);
     if (Math.abs(v) >= 10) return v.toFixed(1);
     return v.toFixed(2);
@@ -839,6 +848,15 @@
       }
     }
   }
+
+  // For scripts that measure the page: move the view and draw at once.
+  window.veltoReport = {
+    fullStart, fullEnd,
+    show(start, end) {
+      setView(start, end);
+      draw();
+    },
+  };
 
   fillTables();
   frameFromLocation();
