@@ -214,7 +214,7 @@
   function sizeCanvas(canvas, height) {
     const ratio = window.devicePixelRatio || 1;
     const width = canvas.clientWidth;
-    canvas.style.height = height + 'px';
+    if (canvas.style.height !== height + 'px') canvas.style.height = height + 'px';
     if (canvas.width !== Math.round(width * ratio) || canvas.height !== Math.round(height * ratio)) {
       canvas.width = Math.round(width * ratio);
       canvas.height = Math.round(height * ratio);
@@ -240,6 +240,9 @@
     out[at + 3] = 255;
   }
 
+  const heatBitmap = document.createElement('canvas');
+  heatBitmap.height = PAD_COUNT;
+
   function drawHeat(context, spans, columns, top, height) {
     const source = showLevels ? levels : readings;
     const high = showLevels ? heatHigh.levels : heatHigh.readings;
@@ -257,10 +260,9 @@
         heatColour(peak, high, pixels, at);
       }
     }
-    const bitmap = document.createElement('canvas');
-    bitmap.width = columns;
-    bitmap.height = PAD_COUNT;
-    bitmap.getContext('2d').putImageData(image, 0, 0);
+    if (heatBitmap.width !== columns) heatBitmap.width = columns;
+    heatBitmap.getContext('2d').putImageData(image, 0, 0);
+    const bitmap = heatBitmap;
     context.imageSmoothingEnabled = false;
     context.drawImage(bitmap, MARGIN_LEFT, top, plotWidth(), height);
     context.fillStyle = '#1d232a';
@@ -318,24 +320,44 @@
   function drawRegion(context, spans, columns, top, height) {
     const step = plotWidth() / columns;
     const counts = [0, 0, 0, 0];
+    // Runs of one region, one path per region.
+    const runs = [[], [], [], []];
+    let runRegion = -1;
+    let runStart = 0;
+    const closeRun = (c) => { if (runRegion >= 0) runs[runRegion].push(runStart, c); };
     for (let c = 0; c < columns; c++) {
       const a = spans.first[c];
-      if (a < 0) continue;
-      counts.fill(0);
-      for (let i = a; i < spans.end[c]; i++) counts[col.region[i]]++;
-      // The region most of the column's frames are in; none only when all are.
-      let region = 0;
-      for (let r = 1; r < 4; r++) if (counts[r] > (region ? counts[region] : 0)) region = r;
+      let region = -1;
+      if (a >= 0) {
+        counts.fill(0);
+        for (let i = a; i < spans.end[c]; i++) counts[col.region[i]]++;
+        // The region most of the column's frames are in; none only when all are.
+        region = 0;
+        for (let r = 1; r < 4; r++) if (counts[r] > (region ? counts[region] : 0)) region = r;
+      }
+      if (region !== runRegion) {
+        closeRun(c);
+        runRegion = region;
+        runStart = c;
+      }
+    }
+    closeRun(columns);
+    for (let region = 0; region < 4; region++) {
+      context.beginPath();
+      for (let k = 0; k < runs[region].length; k += 2) {
+        context.rect(MARGIN_LEFT + runs[region][k] * step, top, (runs[region][k + 1] - runs[region][k]) * step, height);
+      }
       context.fillStyle = region === 0 ? '#eef1f4' : REGION_COLOURS[region];
-      context.fillRect(MARGIN_LEFT + c * step, top, Math.ceil(step), height);
+      context.fill();
     }
   }
 
-  function markerPath(context, gesture, x, y, size) {
-    context.beginPath();
+  // Adds one marker to the current path: the shape tells the gesture.
+  function addMarker(context, gesture, x, y, size) {
     switch (gesture) {
       case 'may-begin':
       case 'tap':
+        context.moveTo(x + size, y);
         context.arc(x, y, size, 0, Math.PI * 2);
         break;
       case 'hold-start':
@@ -362,77 +384,95 @@
     }
   }
 
+  // Markers that look alike are drawn as one path: zoomed out there are
+  // thousands of them.
   function drawEvents(context, top, height) {
     const left = MARGIN_LEFT;
     const right = MARGIN_LEFT + plotWidth();
     const visible = (x) => x >= left - 8 && x <= right + 8;
     markerHits = [];
+    // Many marks can fall on one pixel: each pixel column takes a kind of mark once.
+    const drawn = new Set();
+    const firstAt = (x, kind) => {
+      const key = Math.round(x) + kind;
+      if (drawn.has(key)) return false;
+      drawn.add(key);
+      return true;
+    };
+    const lineAcross = (marks, kind, colour) => {
+      context.beginPath();
+      for (const mark of marks) {
+        const x = Math.round(xOf(mark.t)) + 0.5;
+        if (!visible(x) || !firstAt(x, kind)) continue;
+        context.moveTo(x, 0);
+        context.lineTo(x, top + height);
+      }
+      context.strokeStyle = colour;
+      context.stroke();
+    };
     // Gaps and resets cross every lane.
     context.save();
     context.setLineDash([3, 3]);
-    for (const gap of gaps) {
-      const x = xOf(gap.t);
-      if (!visible(x)) continue;
-      context.strokeStyle = '#e08a00';
-      context.beginPath();
-      context.moveTo(x, 0);
-      context.lineTo(x, top + height);
-      context.stroke();
-    }
-    for (const reset of resets) {
-      const x = xOf(reset.t);
-      if (!visible(x)) continue;
-      context.strokeStyle = '#8e24aa';
-      context.beginPath();
-      context.moveTo(x, 0);
-      context.lineTo(x, top + height);
-      context.stroke();
-    }
+    context.lineWidth = 1;
+    lineAcross(gaps, 'gap', '#e08a00');
+    lineAcross(resets, 'reset', '#8e24aa');
     context.restore();
 
     const gestureRow = top + 14;
     const stateRow = top + 36;
-    context.lineWidth = 1.5;
+    const styles = new Map();
     for (const event of gestures) {
       const x = xOf(event.t);
-      if (!visible(x)) continue;
-      const colour = REGION_COLOURS[Math.max(0, REGION_NAMES.indexOf(event.region))];
-      const y = gestureRow;
-      markerPath(context, event.gesture, x, y, 5);
-      if (event.gesture === 'may-begin' || event.gesture === 'cancel') {
+      const style = event.gesture + ' ' + event.region;
+      if (!visible(x) || !firstAt(x, style)) continue;
+      if (!styles.has(style)) styles.set(style, []);
+      styles.get(style).push(x);
+      markerHits.push({ x, y: gestureRow, event });
+    }
+    context.lineWidth = 1.5;
+    for (const [style, xs] of styles) {
+      const [gesture, region] = style.split(' ');
+      context.beginPath();
+      for (const x of xs) addMarker(context, gesture, x, gestureRow, 5);
+      const colour = REGION_COLOURS[Math.max(0, REGION_NAMES.indexOf(region))];
+      if (gesture === 'may-begin' || gesture === 'cancel') {
         context.strokeStyle = colour;
         context.stroke();
       } else {
         context.fillStyle = colour;
         context.fill();
       }
-      markerHits.push({ x, y, event });
     }
+
     context.font = '10px system-ui, sans-serif';
     context.textBaseline = 'middle';
     context.textAlign = 'left';
+    let labelEnd = -Infinity;
+    context.fillStyle = '#8e24aa';
     for (const reset of resets) {
       const x = xOf(reset.t);
-      if (!visible(x)) continue;
-      context.fillStyle = '#8e24aa';
+      if (!visible(x) || x < labelEnd) continue;
+      labelEnd = x + 30;
       context.fillText('reset', x + 3, gestureRow + 12);
     }
-    let lastLabelEnd = -Infinity;
+    labelEnd = -Infinity;
     for (const state of states) {
       const x = xOf(state.t);
       if (!visible(x)) continue;
       context.fillStyle = '#5e35b1';
       context.fillRect(x - 1, stateRow - 5, 2, 10);
-      if (x > lastLabelEnd) {
+      if (x > labelEnd) {
         const text = state.key + '=' + truncate(state.value, 24);
         context.fillText(text, x + 3, stateRow);
-        lastLabelEnd = x + 3 + context.measureText(text).width + 6;
+        labelEnd = x + 3 + context.measureText(text).width + 6;
       }
     }
+    labelEnd = -Infinity;
+    context.fillStyle = '#b36b00';
     for (const gap of gaps) {
       const x = xOf(gap.t);
-      if (!visible(x)) continue;
-      context.fillStyle = '#b36b00';
+      if (!visible(x) || x < labelEnd) continue;
+      labelEnd = x + 70;
       context.fillText('gap ' + gap.previous + '→' + gap.frame, x + 3, stateRow + 12);
     }
   }
@@ -474,8 +514,13 @@
     context.fillText(showLevels ? 'levels' : 'readings', MARGIN_LEFT + 4, 2);
   }
 
-  function drawChart() {
-    const context = sizeCanvas(chart, chartHeight);
+  // The plot is drawn into a layer that only a change of view, of width or
+  // of the heat map's source redraws; moving the cursor copies the layer and
+  // draws one line.
+  const chartLayer = document.createElement('canvas');
+  let chartLayerKey = '';
+
+  function drawLayer(context) {
     context.clearRect(0, 0, chart.clientWidth, chartHeight);
     const ratio = window.devicePixelRatio || 1;
     const columns = Math.max(1, Math.floor(plotWidth() * ratio));
@@ -489,6 +534,23 @@
     drawEvents(context, laneTop('events'), LANES[5].height);
     drawAxis(context, laneTop('axis'));
     drawLabels(context);
+  }
+
+  function drawChart() {
+    const context = sizeCanvas(chart, chartHeight);
+    const ratio = window.devicePixelRatio || 1;
+    const key = [view.start, view.end, showLevels, chart.width, chart.height].join(',');
+    if (key !== chartLayerKey) {
+      // Setting a canvas's size reallocates it, even to the same size.
+      if (chartLayer.width !== chart.width) chartLayer.width = chart.width;
+      if (chartLayer.height !== chart.height) chartLayer.height = chart.height;
+      const layer = chartLayer.getContext('2d');
+      layer.setTransform(ratio, 0, 0, ratio, 0, 0);
+      drawLayer(layer);
+      chartLayerKey = key;
+    }
+    context.clearRect(0, 0, chart.clientWidth, chartHeight);
+    context.drawImage(chartLayer, 0, 0, chart.clientWidth, chartHeight);
     if (cursor >= 0) {
       const x = Math.round(xOf(col.t[cursor])) + 0.5;
       context.strokeStyle = 'rgba(0, 0, 0, 0.55)';
@@ -500,16 +562,21 @@
     }
   }
 
-  function drawOverview() {
-    const height = 44;
-    const context = sizeCanvas(overview, height);
-    const width = overview.clientWidth;
-    context.clearRect(0, 0, width, height);
+  // The strip's bars depend only on its width: drawn once per width, then
+  // copied under the view's window at every redraw.
+  let overviewBars = null;
+  function overviewBarsFor(width, height) {
+    const ratio = window.devicePixelRatio || 1;
+    if (overviewBars && overviewBars.width === Math.round(width * ratio)) return overviewBars;
+    overviewBars = document.createElement('canvas');
+    overviewBars.width = Math.round(width * ratio);
+    overviewBars.height = Math.round(height * ratio);
+    const context = overviewBars.getContext('2d');
+    context.scale(ratio, ratio);
     const columns = Math.max(1, Math.floor(width));
     const span = (fullEnd - fullStart) / columns;
     const [low, high] = ranges.touch;
     let i = 0;
-    context.fillStyle = '#c9d3dc';
     for (let c = 0; c < columns; c++) {
       const c1 = fullStart + (c + 1) * span;
       let max = -Infinity;
@@ -524,6 +591,15 @@
       context.fillStyle = region ? REGION_COLOURS[region] : '#c9d3dc';
       context.fillRect(c, height - 2 - h, 1, h);
     }
+    return overviewBars;
+  }
+
+  function drawOverview() {
+    const height = 44;
+    const context = sizeCanvas(overview, height);
+    const width = overview.clientWidth;
+    context.clearRect(0, 0, width, height);
+    context.drawImage(overviewBarsFor(width, height), 0, 0, width, height);
     const x0 = (view.start - fullStart) / (fullEnd - fullStart) * width;
     const x1 = (view.end - fullStart) / (fullEnd - fullStart) * width;
     context.fillStyle = 'rgba(31, 95, 191, 0.12)';
