@@ -20,11 +20,12 @@ void ReportCommand::run(const Options& options, std::ostream& err)
         report.frames.first = range.first;
         report.frames.last = range.last;
     }
-    // A bad output path fails before the replay.
-    std::ofstream out = ToolFiles::create(options.output);
-
+    // The recording is read before the output is opened, so that a bad
+    // recording leaves no empty page behind; a bad output path still fails
+    // before the replay.
     VeltoTouch::PipelineRecording recording = ToolFiles::readRecording(options.file);
     report.containerVersion = RecordingReport::containerVersion(ToolFiles::read(options.file));
+    std::ofstream out = ToolFiles::create(options.output);
     report.source = std::filesystem::path(options.file).filename().string();
     report.title = options.title.empty() ? report.source : options.title;
     report.settings = options.settings;

@@ -5,7 +5,8 @@
 
 #include <nlohmann/json.hpp>
 
-#include <stdexcept>
+#include <string_view>
+#include <vector>
 
 namespace VeltoTouch {
 
@@ -23,6 +24,8 @@ public:
     bool number_unsigned(number_unsigned_t value) override { return settle(value); }
     bool number_float(number_float_t value, const string_t&) override
     {
+        // Only numbers a version can be are converted; the cast of others is undefined.
+        if (!(value >= 0 && value < 1e19)) return settle(std::nullopt);
         return settle(static_cast<std::uint64_t>(value));
     }
     bool string(string_t&) override { return settle(std::nullopt); }
@@ -68,6 +71,31 @@ private:
     int _depth = 0;
     bool _wanted = false;
 };
+
+// The template with each slot replaced, in one pass over the template, so
+// that text put into one slot is never searched for another.
+std::string fillTemplate(std::string_view page, const std::vector<std::pair<std::string_view, std::string>>& slots)
+{
+    std::string out;
+    std::size_t at = 0;
+    for (;;) {
+        std::size_t next = std::string_view::npos;
+        const std::pair<std::string_view, std::string>* slot = nullptr;
+        for (const auto& candidate : slots) {
+            const std::size_t found = page.find(candidate.first, at);
+            if (found < next) {
+                next = found;
+                slot = &candidate;
+            }
+        }
+        if (!slot) break;
+        out.append(page.substr(at, next - at));
+        out += slot->second;
+        at = next + slot->first.size();
+    }
+    out.append(page.substr(at));
+    return out;
+}
 
 void replaceAll(std::string& text, std::string_view from, std::string_view to)
 {
@@ -170,15 +198,10 @@ std::string RecordingReport::html(PipelineRecording& recording, const std::share
     std::string data = JsonValue::dump(payload, false);
     replaceAll(data, "<", "\\u003c");
 
-    std::string page(ReportTemplate::kHtml);
-    // The data goes in last: the other texts then cannot be matched inside it.
-    replaceAll(page, "{{title}}", htmlEscaped(options.title));
-    replaceAll(page, "/*{{style}}*/", ReportTemplate::kStyle);
-    replaceAll(page, "/*{{script}}*/", ReportTemplate::kScript);
-    const std::size_t at = page.find("{{data}}");
-    if (at == std::string::npos) throw std::logic_error("report page template has no data slot");
-    page.replace(at, std::string_view("{{data}}").size(), data);
-    return page;
+    return fillTemplate(ReportTemplate::kHtml, {{"{{title}}", htmlEscaped(options.title)},
+                                                {"/*{{style}}*/", std::string(ReportTemplate::kStyle)},
+                                                {"/*{{script}}*/", std::string(ReportTemplate::kScript)},
+                                                {"{{data}}", std::move(data)}});
 }
 
 }  // namespace VeltoTouch

@@ -62,16 +62,16 @@ TEST(ReportCommandTest, FramesLimitThePageToTheirFramesAndEvents)
     TempDir dir;
     const fs::path page = dir.file("taps.html");
     const ToolRun report = runTool({"report", kExamples + "/taps.json", "-o", page, "--frames", "21:32", "--title",
-                                    "</script><b>taps</b>", "--set", "Algs.HoldTimeoutMilliseconds=600"});
+                                    "</script><b>{{data}}</b>", "--set", "Algs.HoldTimeoutMilliseconds=600"});
     ASSERT_EQ(report.status, 0) << report.err;
     const std::string html = readFile(page);
     const nlohmann::json payload = payloadOf(html);
     EXPECT_EQ(payload["frameCount"], 12);
     EXPECT_EQ(eventsOfPayload(payload), (std::vector<std::string>{"may-begin top 21", "tap top 32"}));
-    EXPECT_EQ(payload["title"], "</script><b>taps</b>");
+    EXPECT_EQ(payload["title"], "</script><b>{{data}}</b>");
     EXPECT_EQ(payload["facts"]["settings"], nlohmann::json::parse(R"([["Algs.HoldTimeoutMilliseconds","600"]])"));
     EXPECT_EQ(payload["facts"]["containerVersion"], "1");
-    EXPECT_EQ(html.find("<b>taps"), std::string::npos) << "the title reached the page unescaped";
+    EXPECT_EQ(html.find("<b>"), std::string::npos) << "the title reached the page unescaped";
 }
 
 TEST(ReportCommandTest, BadInputIsRefusedWithAMessage)
