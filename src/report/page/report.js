@@ -927,7 +927,7 @@
 
   // For scripts that measure the page: move the view and draw at once.
   window.veltoReport = {
-    fullStart, fullEnd,
+    fullStart, fullEnd, view,
     show(start, end) {
       setView(start, end);
       draw();
