@@ -75,14 +75,14 @@ ReportCollector::ReportCollector(Pipeline& pipeline, FrameRange range) : _pipeli
         mark["t"] = _nowUs;
         mark["key"] = key;
         mark["value"] = JsonValue::dump(JsonValue::toJson(value), false);
-        holdForNextFrame(std::move(mark), "states");
+        holdForNextFrame(MarkList::States, std::move(mark));
     };
     _pipeline.disjointImageProbe = [this](std::uint32_t previous, const InputReport::Image& image) {
         nlohmann::ordered_json mark;
         mark["t"] = _nowUs;
         mark["previous"] = previous;
         mark["frame"] = image.frameNumber;
-        holdForNextFrame(std::move(mark), "gaps");
+        holdForNextFrame(MarkList::Gaps, std::move(mark));
     };
     _pipeline.invalidInputReportProbe = [this](const std::uint8_t*, std::size_t) { ++_ignoredReports; };
     _pipeline.setDecisionObserver(this);
@@ -107,7 +107,7 @@ void ReportCollector::setTime(std::uint64_t ticks)
     _nowUs = std::max(_nowUs, us);
 }
 
-void ReportCollector::holdForNextFrame(nlohmann::ordered_json mark, const char* list)
+void ReportCollector::holdForNextFrame(MarkList list, nlohmann::ordered_json mark)
 {
     _pending.emplace_back(list, std::move(mark));
 }
@@ -122,7 +122,7 @@ void ReportCollector::frameDecided(const DecisionRecord& record)
     const auto index = static_cast<std::int64_t>(_frameCount);
     for (auto& [list, mark] : _pending) {
         mark["i"] = index;
-        (std::string_view(list) == "states" ? _states : _gaps).push_back(std::move(mark));
+        (list == MarkList::States ? _states : _gaps).push_back(std::move(mark));
     }
     _pending.clear();
 

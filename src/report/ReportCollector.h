@@ -47,12 +47,13 @@ private:
         std::string name;
         ColumnEncoder encoder;
     };
+    enum class MarkList { States, Gaps };
 
     void setTime(std::uint64_t ticks);
     void addEvents(const VeltoHost::HidEventList& events);
     // Marks that come before the frame they belong to wait for it, so that
     // they are dropped with it when it is out of range.
-    void holdForNextFrame(nlohmann::ordered_json mark, const char* list);
+    void holdForNextFrame(MarkList list, nlohmann::ordered_json mark);
     ColumnEncoder& column(std::size_t index) { return _columns[index].encoder; }
 
     Pipeline& _pipeline;
@@ -62,7 +63,7 @@ private:
     std::vector<Column> _columns;
     std::size_t _frameCount = 0;
     bool _lastFrameIncluded = false;
-    std::vector<std::pair<const char*, nlohmann::ordered_json>> _pending;
+    std::vector<std::pair<MarkList, nlohmann::ordered_json>> _pending;
     nlohmann::ordered_json _events = nlohmann::ordered_json::array();
     nlohmann::ordered_json _states = nlohmann::ordered_json::array();
     nlohmann::ordered_json _gaps = nlohmann::ordered_json::array();
