@@ -645,12 +645,19 @@
 
   function truncate(text, length) { return text.length > length ? text.slice(0, length - 1) + '…' : text; }
 
-  // printf's %f of a float: six decimals, "nan"/"inf", and the sign of -0.
+  // printf's %f of a float, digit for digit: six decimals, ties to even,
+  // "nan", "inf" and the sign of -0. A float times 10^6 is exact in a double
+  // (24 + 14 significant bits), so the rounding needs no decimal arithmetic.
   function printfFloat(v) {
-    if (Number.isNaN(v)) return Object.is(v, NaN) ? 'nan' : '-nan';
+    if (Number.isNaN(v)) return 'nan';
     if (!Number.isFinite(v)) return v > 0 ? 'inf' : '-inf';
-    const text = v.toFixed(6);
-    return Object.is(v, -0) || (v < 0 && text[0] !== '-') ? '-' + text : text;
+    const sign = v < 0 || Object.is(v, -0) ? '-' : '';
+    const scaled = Math.abs(v) * 1e6;
+    let whole = Math.floor(scaled);
+    const rest = scaled - whole;
+    if (rest > 0.5 || (rest === 0.5 && whole % 2 === 1)) whole += 1;
+    const digits = BigInt(whole).toString().padStart(7, '0');
+    return sign + digits.slice(0, -6) + '.' + digits.slice(-6);
   }
 
   function pad4(v) { return String(v).padStart(4, ' '); }
