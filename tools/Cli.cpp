@@ -76,7 +76,7 @@ std::string usageLine(const CLI::App& app, const CLI::ParseError& error, int arg
     std::string message = error.what();
     // CLI11 takes a word that is no command for a missing command.
     if (app.get_subcommands().empty() && argc > 1 && argv[1][0] != '-') {
-        message = std::string("no command \"") + argv[1] + "\" (replay, synth, dump, host, daemon, ctl, help)";
+        message = std::string("no command \"") + argv[1] + "\" (replay, synth, dump, host, daemon, ctl, report, help)";
     }
     std::replace(message.begin(), message.end(), '\n', ' ');
     std::string help = "veltotouch help";
@@ -238,7 +238,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             return command->get_name() == helpTopic && command != helpCommand;
         });
         if (commands.empty()) {
-            err << "veltotouch: help: no command \"" << helpTopic << "\" (replay, synth, dump, host, daemon, ctl)\n";
+            err << "veltotouch: help: no command \"" << helpTopic << "\" (replay, synth, dump, host, daemon, ctl, report)\n";
             return kUsageError;
         }
         out << commands.front()->help("veltotouch");
