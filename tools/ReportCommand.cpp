@@ -6,7 +6,10 @@
 #include "report/RecordingReport.h"
 
 #include <filesystem>
+#include <fstream>
+#include <functional>
 #include <memory>
+#include <string>
 
 namespace VeltoTool {
 
@@ -20,11 +23,14 @@ void ReportCommand::run(const Options& options, std::ostream& err)
         report.frames.first = range.first;
         report.frames.last = range.last;
     }
-    // The recording is read before the output is opened, so that a bad
-    // recording leaves no empty page behind; a bad output path still fails
-    // before the replay.
-    VeltoTouch::PipelineRecording recording = ToolFiles::readRecording(options.file);
-    report.containerVersion = RecordingReport::containerVersion(ToolFiles::read(options.file));
+    // The recording is read as it plays, so that its length does not matter.
+    // A bad output path fails before the replay; a recording that turns out
+    // bad leaves no page behind.
+    const ToolFiles::File recording = ToolFiles::openRecording(options.file);
+    {
+        std::ifstream container(options.file, std::ios::binary);
+        report.containerVersion = RecordingReport::containerVersion(container);
+    }
     std::ofstream out = ToolFiles::create(options.output);
     report.source = std::filesystem::path(options.file).filename().string();
     report.title = options.title.empty() ? report.source : options.title;
@@ -32,7 +38,19 @@ void ReportCommand::run(const Options& options, std::ostream& err)
 
     auto pipeline = std::make_shared<VeltoTouch::Pipeline>();
     StateArguments::apply(*pipeline, options.settings, err);
-    out << RecordingReport::html(recording, pipeline, report);
+    std::string page;
+    try {
+        page = RecordingReport::html(
+            [&](const std::function<void(VeltoTouch::PipelineRecording::Frame&&)>& play) {
+                ToolFiles::streamRecording(recording.get(), options.file, play);
+            },
+            pipeline, report);
+    } catch (...) {
+        out.close();
+        std::filesystem::remove(options.output);
+        throw;
+    }
+    out << page;
     ToolFiles::close(out, options.output);
 }
 

@@ -5,6 +5,7 @@
 
 #include <nlohmann/json.hpp>
 
+#include <istream>
 #include <string_view>
 #include <vector>
 
@@ -131,24 +132,32 @@ nlohmann::ordered_json countersAsText(const nlohmann::ordered_json& stats)
     return out;
 }
 
-nlohmann::ordered_json facts(const PipelineRecording& recording, const RecordingReport::Options& options,
-                             std::size_t pageFrames)
-{
+// What the page tells of the recording itself, counted as it plays.
+struct FrameCounts {
     std::uint64_t reports = 0;
     std::uint64_t states = 0;
     std::optional<std::uint64_t> first;
     std::uint64_t last = 0;
-    for (const PipelineRecording::Frame& frame : recording.frames()) {
+
+    void add(const PipelineRecording::Frame& frame)
+    {
         if (frame.type == PipelineRecording::Frame::Type::InputReport) ++reports;
         if (frame.type == PipelineRecording::Frame::Type::State) ++states;
         if (!first) first = frame.timestampNs;
         last = frame.timestampNs;
     }
+};
+
+nlohmann::ordered_json facts(const FrameCounts& counts, const RecordingReport::Options& options,
+                             std::size_t pageFrames)
+{
+    const std::optional<std::uint64_t>& first = counts.first;
+    const std::uint64_t last = counts.last;
     nlohmann::ordered_json out;
     out["source"] = options.source;
-    out["frames"] = recording.frames().size();
-    out["reports"] = reports;
-    out["stateFrames"] = states;
+    out["frames"] = counts.reports + counts.states;
+    out["reports"] = counts.reports;
+    out["stateFrames"] = counts.states;
     out["pageFrames"] = pageFrames;
     // Nanosecond time stamps pass 2^53 too.
     out["durationNs"] = first && last >= *first ? std::to_string(last - *first) : "0";
@@ -169,26 +178,28 @@ nlohmann::ordered_json facts(const PipelineRecording& recording, const Recording
 
 }  // namespace
 
-std::optional<std::uint64_t> RecordingReport::containerVersion(std::string_view containerText)
+std::optional<std::uint64_t> RecordingReport::containerVersion(std::istream& container)
 {
     VersionScanner scanner;
-    nlohmann::json::sax_parse(containerText, &scanner);
+    nlohmann::json::sax_parse(container, &scanner);
     return scanner.version;
 }
 
-std::string RecordingReport::html(PipelineRecording& recording, const std::shared_ptr<Pipeline>& pipeline,
+std::string RecordingReport::html(const FrameSource& frames, const std::shared_ptr<Pipeline>& pipeline,
                                   const Options& options)
 {
     nlohmann::ordered_json payload;
     {
         ReportCollector collector(*pipeline, options.frames);
-        recording.pipeline = pipeline;
-        recording.sleepMicroseconds = [](std::uint64_t) {};
-        recording.playReset();
-        while (recording.playCanContinue()) recording.playNextFrame(1.0f);
-        recording.pipeline = nullptr;
+        FrameCounts counts;
+        PipelineRecording::PlayClock clock;
+        frames([&](PipelineRecording::Frame&& frame) {
+            if (!counts.first) clock.reset();
+            counts.add(frame);
+            PipelineRecording::playFrame(frame, clock, *counts.first, 1.0f, {}, pipeline.get());
+        });
         payload = collector.payload();
-        payload["facts"] = facts(recording, options, collector.frameCount());
+        payload["facts"] = facts(counts, options, collector.frameCount());
     }
     payload["title"] = options.title;
     payload["counters"] = countersAsText(JsonValue::toJson(pipeline->getState("Algs.EventStats")));

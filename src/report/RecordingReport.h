@@ -5,6 +5,8 @@
 #include "report/ReportCollector.h"
 
 #include <cstdint>
+#include <functional>
+#include <istream>
 #include <memory>
 #include <optional>
 #include <string>
@@ -31,14 +33,19 @@ public:
         ReportCollector::FrameRange frames;
     };
 
-    // Plays every frame of `recording` through `pipeline` (already set up by
-    // the caller) as fast as possible and returns the page.
-    static std::string html(PipelineRecording& recording, const std::shared_ptr<Pipeline>& pipeline,
+    // Hands every frame of a recording, in order, to the function it is given
+    // (ToolFiles::streamRecording reading a file, or a loop over a recording
+    // held in memory).
+    using FrameSource = std::function<void(const std::function<void(PipelineRecording::Frame&&)>& play)>;
+
+    // Plays every frame through `pipeline` (already set up by the caller) as
+    // fast as possible, as the source hands them over, and returns the page.
+    static std::string html(const FrameSource& frames, const std::shared_ptr<Pipeline>& pipeline,
                             const Options& options);
 
-    // The "Version" of a container's text, as its top level states it; empty
-    // when the text has none.
-    static std::optional<std::uint64_t> containerVersion(std::string_view containerText);
+    // The "Version" a container states at its top level, read up to there
+    // only; empty when it has none.
+    static std::optional<std::uint64_t> containerVersion(std::istream& container);
 };
 
 }  // namespace VeltoTouch
