@@ -82,8 +82,14 @@ TEST(ReportCommandTest, BadInputIsRefusedWithAMessage)
         int status;
         std::string message;
     };
+    // Good frames, then a fault: found only while the page is being made.
+    std::string faulty = readFile(kExamples + "/taps.json");
+    faulty.resize(faulty.rfind(']'));
+    faulty += R"(, {"Type": "Gesture", "Timestamp": 1}]})";
+    const std::string faultyFile = dir.file("faulty.json", faulty);
     const std::vector<Case> cases = {
         {{"report", (dir.path() / "missing.json").string(), "-o", dir.file("a.html")}, 1, "missing.json"},
+        {{"report", faultyFile, "-o", dir.file("a.html")}, 1, "faulty.json: invalid frame type"},
         {{"report", kExamples + "/taps.json", "-o", (dir.path() / "no/such/dir/a.html").string()}, 1, "a.html"},
         {{"report", kExamples + "/taps.json", "-o", dir.file("a.html"), "--frames", "x:y"}, 2, "--frames"},
         {{"report", kExamples + "/taps.json"}, 2, "--output"},
@@ -92,6 +98,7 @@ TEST(ReportCommandTest, BadInputIsRefusedWithAMessage)
         const ToolRun run = runTool(c.arguments);
         EXPECT_EQ(run.status, c.status) << c.arguments[1];
         EXPECT_NE(run.err.find(c.message), std::string::npos) << run.err;
+        EXPECT_FALSE(fs::exists(dir.file("a.html"))) << "a page was left behind: " << c.arguments[1];
     }
 }
 
