@@ -53,7 +53,7 @@ void HandStats::Reset() noexcept
     maxActiveIndex = 0;
 }
 
-void HandStats::updateHandState(std::vector<Pixel> pixels, std::vector<VirtualPixel> virtualPixels,
+void HandStats::updateHandState(const std::vector<Pixel>& pixels, const std::vector<VirtualPixel>& virtualPixels,
                                 unsigned int frameTime)
 {
     const FrameScan scan = scanFrame(pixels, virtualPixels);

@@ -31,7 +31,8 @@ public:
     // Forgets the touch that just ended.
     void Reset() noexcept;
 
-    void updateHandState(std::vector<Pixel> pixels, std::vector<VirtualPixel> virtualPixels, unsigned int frameTime);
+    void updateHandState(const std::vector<Pixel>& pixels, const std::vector<VirtualPixel>& virtualPixels,
+                         unsigned int frameTime);
     void updateTouchScore(const std::vector<Pixel>& pixels, const std::vector<VirtualPixel>& virtualPixels,
                           unsigned int frameTime);
     void decayTouchScore(unsigned int frameTime);

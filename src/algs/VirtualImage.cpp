@@ -38,18 +38,22 @@ VirtualImage::VirtualImage()
 
 void VirtualImage::updateValues(const std::vector<Pixel>& pixels)
 {
-    values.assign(values.size(), 0);
+    // Runs every frame: the groups name pads of the fixed layout (A to O),
+    // so indexing needs no range checks.
+    const Pixel* pads = pixels.data();
     for (std::size_t j = 0; j < groups.size(); ++j) {
+        std::int32_t sum = 0;
+        std::int32_t& strongest = maxIndex[j];
         for (char letter : groups[j]) {
             const int pad = padIndexOfLetter(letter);
-            const std::int32_t padValue = pixels.at(static_cast<std::size_t>(pad)).value;
+            const std::int32_t padValue = pads[pad].value;
             if (padValue <= Pixel::kNoiseLevel) continue;
-            values.at(j) += padValue;
+            sum += padValue;
             // The first strongest member wins a tie, and the one already
             // recorded keeps it, so the index does not flicker between equals.
-            std::int32_t& strongest = maxIndex.at(j);
-            if (padValue > pixels.at(static_cast<std::size_t>(strongest)).value) strongest = pad;
+            if (padValue > pads[strongest].value) strongest = pad;
         }
+        values[j] = sum;
     }
 }
 
