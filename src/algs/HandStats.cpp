@@ -175,17 +175,39 @@ void HandStats::updateRegionMax(const std::vector<Pixel>& pixels)
     }
 }
 
+// The first two pads of `pixels` stably sorted by falling maxRatio, found in
+// one pass: this runs on every frame of a touch, where a copy and a sort
+// cost more than the rest of the decision. A ratio that is not a number
+// (possible only with a threshold that is not one) makes no strict order, and
+// the sort itself then decides.
+std::pair<const Pixel*, const Pixel*> HandStats::strongestTwo(const std::vector<Pixel>& pixels)
+{
+    const auto byRatio = [](const Pixel& a, const Pixel& b) { return a.maxRatio > b.maxRatio; };
+    if (std::none_of(pixels.begin(), pixels.end(), [](const Pixel& pad) { return std::isnan(pad.maxRatio); })) {
+        std::size_t top = 0;
+        for (std::size_t i = 1; i < pixels.size(); ++i) {
+            if (byRatio(pixels[i], pixels[top])) top = i;
+        }
+        std::size_t second = top == 0 ? 1 : 0;
+        for (std::size_t i = second + 1; i < pixels.size(); ++i) {
+            if (i != top && byRatio(pixels[i], pixels[second])) second = i;
+        }
+        if (second < pixels.size()) return {&pixels[top], &pixels[second]};
+    }
+    _ranked = pixels;
+    std::stable_sort(_ranked.begin(), _ranked.end(), byRatio);
+    return {&_ranked.at(0), &_ranked.at(1)};
+}
+
 PixelRegion HandStats::updateActiveRegion(const std::vector<Pixel>& pixels,
                                           const std::vector<VirtualPixel>& virtualPixels, unsigned int frameTime)
 {
     PixelRegion candidate = Pixel::regionOfPad(maxActiveIndex);
 
-    // Strongest pads of the touch so far; equal pads keep pad order.
-    std::vector<Pixel> ranked(pixels);
-    std::stable_sort(ranked.begin(), ranked.end(),
-                     [](const Pixel& a, const Pixel& b) { return a.maxRatio > b.maxRatio; });
-    const Pixel& top = ranked.at(0);
-    const Pixel& second = ranked.at(1);
+    // The two strongest pads of the touch so far; equal pads keep pad order.
+    const auto [topPad, secondPad] = strongestTwo(pixels);
+    const Pixel& top = *topPad;
+    const Pixel& second = *secondPad;
 
     const float bias = updateTimeBiasFactor(frameTime);
     const float noise = static_cast<float>(Pixel::kNoiseLevel) / activationThreshold;
