@@ -201,23 +201,26 @@ public:
     bool String(const char* text, rapidjson::SizeType length, bool)
     {
         return event([&] {
+            // Checked even where it is skipped: the whole-text reader refuses
+            // malformed text anywhere in the document.
+            std::string value = checkedText(text, length);
             if (_skipUntilDepth) return true;
             if (_fields && !_capture) {
                 ContainerFrames::Field& field = *_field;
                 field.present = true;
                 field.isText = true;
-                field.text = checkedText(text, length);
+                field.text = std::move(value);
                 field.value = PropertyValue();
                 return true;
             }
-            return scalar(PropertyValue::string(checkedText(text, length)));
+            return scalar(PropertyValue::string(std::move(value)));
         });
     }
     bool Key(const char* text, rapidjson::SizeType length, bool)
     {
         return event([&] {
-            if (_skipUntilDepth) return true;
             std::string key = checkedText(text, length);
+            if (_skipUntilDepth) return true;
             if (_capture) return _capture->key(key);
             if (_fields) {
                 _field = &_fields->named(key);

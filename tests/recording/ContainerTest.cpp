@@ -286,6 +286,8 @@ TEST(RecordingContainer, EveryFaultRaisesItsMessageInItsFamily)
          Family::Runtime, prefix + "invalid container"},
         {"surrogate in a value", v1 + "{\"Type\": \"State\", \"Timestamp\": 1, \"Key\": \"k\", \"Value\": [\"\xed\xa0\x80\"]}]}",
          Family::Runtime, prefix + "invalid container"},
+        {"invalid utf-8 where nothing is read", "{\"Version\": 1, \"Note\": {\"\xff\": [\"\xc3\"]}, \"Frames\": []}",
+         Family::Runtime, prefix + "invalid container"},
         {"utf-8 cut short", v1 + "{\"Type\": \"InputReport\", \"Timestamp\": 1, \"Report\": \"\xe2\x82\"}]}",
          Family::Runtime, prefix + "invalid container"},
         {"no version", R"({"Frames": []})", Family::Runtime, prefix + "invalid version"},
