@@ -3,6 +3,7 @@
 #include "CtlCommand.h"
 #include "DaemonCommand.h"
 #include "DumpCommand.h"
+#include "EvalCommand.h"
 #include "FiniteNumberCheck.h"
 #include "HostCommand.h"
 #include "ReplayCommand.h"
@@ -11,6 +12,8 @@
 #include "SynthCommand.h"
 #include "ToolError.h"
 #include "ToolVersion.h"
+#include "evaluation/CorpusShard.h"
+#include "evaluation/SweepGrid.h"
 
 #include <CLI/CLI.hpp>
 
@@ -76,7 +79,7 @@ std::string usageLine(const CLI::App& app, const CLI::ParseError& error, int arg
     std::string message = error.what();
     // CLI11 takes a word that is no command for a missing command.
     if (app.get_subcommands().empty() && argc > 1 && argv[1][0] != '-') {
-        message = std::string("no command \"") + argv[1] + "\" (replay, synth, dump, host, daemon, ctl, report, help)";
+        message = std::string("no command \"") + argv[1] + "\" (replay, synth, eval, dump, host, daemon, ctl, report, help)";
     }
     std::replace(message.begin(), message.end(), '\n', ' ');
     std::string help = "veltotouch help";
@@ -122,12 +125,48 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
 
     SynthCommand::Options synth;
     auto* synthCommand = app.add_subcommand("synth", "Write a recording made from a gesture script");
-    synthCommand->add_option("SCRIPT", synth.script, "Gesture script, or @FILE to read it from a file")->required();
+    auto* synthScript = synthCommand->add_option("SCRIPT", synth.script, "Gesture script, or @FILE to read it from a file");
     synthCommand->add_option("-o,--output", synth.output, "Recording to write")->required();
     synthCommand->add_option("--frame-period", synth.framePeriodMs, "Milliseconds between frames, at least 1")
         ->check(FiniteNumberCheck(1))
         ->capture_default_str();
-    synthCommand->add_option("--seed", synth.seed, "Seed of the sensor noise")->capture_default_str();
+    synthCommand->add_option("--seed", synth.seed, "Seed of the sensor noise (and of --random)")->capture_default_str();
+    synthCommand
+        ->add_option("--random", synth.randomTouches,
+                     "N: instead of a SCRIPT, N touches drawn at random (kinds, durations, positions, sizes, noise, gaps)")
+        ->check(CLI::Range(1u, 1'000'000u))
+        ->excludes(synthScript);
+    synthCommand->add_option("--truth", synth.truth,
+                             "TRUTH.jsonl: also write one JSON line per touch, noise and reset (\"auto\": FILE with its "
+                             "extension replaced by .truth.jsonl, where eval looks for it)");
+
+    EvalCommand::Options eval;
+    std::vector<std::string> evalSets;
+    auto* evalCommand = app.add_subcommand("eval", "Measure the recogniser on synthesised recordings against their truth");
+    evalCommand->add_option("FILE", eval.files, "Recordings (with --merge: reports of eval --json)")->required();
+    evalCommand->add_option("--truth", eval.truth, "auto (FILE with its extension replaced by .truth.jsonl) or PATH")
+        ->capture_default_str();
+    evalCommand->add_option("--set", evalSets, "KEY=VALUE: pipeline state before each replay (VALUE is JSON)")
+        ->check(settingCheck());
+    evalCommand->add_option("--sweep", eval.sweeps, "KEY=FROM:TO:STEP: evaluate once per value (repeat for a grid)")
+        ->check(argumentCheck("KEY=FROM:TO:STEP", [](const std::string& text) {
+            try {
+                VeltoTouch::SweepGrid::parseAxis(text);
+            } catch (const std::invalid_argument& error) {
+                throw ToolError(error.what());
+            }
+        }));
+    evalCommand->add_option("-j,--jobs", eval.workers, "Worker threads (default: all cores)")->check(CLI::Range(1u, 1024u));
+    evalCommand->add_option("--shard", eval.shard, "I/N: only every N-th recording, starting at I (0 <= I < N)")
+        ->check(argumentCheck("I/N", [](const std::string& text) {
+            try {
+                VeltoTouch::CorpusShard::parse(text);
+            } catch (const std::invalid_argument& error) {
+                throw ToolError(error.what());
+            }
+        }));
+    evalCommand->add_flag("--merge", eval.merge, "FILEs are reports of eval --json (shards); print them added up");
+    evalCommand->add_flag("--json", eval.json, "One JSON document instead of tables");
 
     DumpCommand::Options dump;
     auto* dumpCommand = app.add_subcommand("dump", "Draw each Image report of a recording over the pad layout");
@@ -238,7 +277,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             return command->get_name() == helpTopic && command != helpCommand;
         });
         if (commands.empty()) {
-            err << "veltotouch: help: no command \"" << helpTopic << "\" (replay, synth, dump, host, daemon, ctl, report)\n";
+            err << "veltotouch: help: no command \"" << helpTopic << "\" (replay, synth, eval, dump, host, daemon, ctl, report)\n";
             return kUsageError;
         }
         out << commands.front()->help("veltotouch");
@@ -251,6 +290,9 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             ReplayCommand::run(replay, out, err);
         } else if (*synthCommand) {
             SynthCommand::run(synth);
+        } else if (*evalCommand) {
+            eval.settings = splitAll(evalSets);
+            return EvalCommand::run(eval, out, err);
         } else if (*dumpCommand) {
             DumpCommand::run(dump, out);
         } else if (*reportCommand) {

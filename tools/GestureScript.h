@@ -32,6 +32,15 @@ public:
         std::uint32_t durationMs = 0;
         // Hold only: when the device reports a reset during the touch.
         std::optional<std::uint32_t> resetAtMs;
+        // How this touch differs from the standard finger (or palm): where in
+        // its region it lands (pad pitches), how broad and how strong the
+        // contact is, and the sensor noise during it (also for noise steps).
+        // Scripts always give the standard; RandomScript varies them.
+        double offsetX = 0;
+        double offsetY = 0;
+        double sizeScale = 1;
+        double strengthScale = 1;
+        std::optional<double> noise;
         int line = 0;  // 1-based, for messages
     };
 

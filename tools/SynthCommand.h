@@ -12,7 +12,12 @@ public:
     struct Options {
         // The script itself, or "@path" to read it from a file.
         std::string script;
+        // Instead of a script: this many touches drawn at random (RandomScript).
+        std::uint32_t randomTouches = 0;
         std::string output;
+        // The truth file (one JSON line per touch), or "auto" for the name
+        // eval looks for beside the output (TruthRecord::pathBeside).
+        std::string truth;
         std::uint32_t framePeriodMs = 10;
         std::uint32_t seed = 1;
     };

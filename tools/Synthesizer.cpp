@@ -1,6 +1,7 @@
 #include "Synthesizer.h"
 
 #include "pipeline/InputReport.h"
+#include "pipeline/Util.h"
 
 #include <algorithm>
 #include <cstdlib>
@@ -9,6 +10,7 @@ namespace VeltoTool {
 
 using Action = GestureScript::Action;
 using VeltoTouch::PipelineRecording;
+using VeltoTouch::TruthRecord;
 
 namespace {
 
@@ -34,15 +36,24 @@ PipelineRecording Synthesizer::synthesize(const std::vector<GestureScript::Step>
     return recording;
 }
 
-void Synthesizer::synthesize(const std::vector<GestureScript::Step>& steps, const FrameSink& sink)
+void Synthesizer::synthesize(const std::vector<GestureScript::Step>& steps, const FrameSink& sink,
+                             const TruthSink& truth)
 {
     _sink = &sink;
+    _truth = truth ? &truth : nullptr;
     idle(kLeadInMs, kSensorNoise);
     for (const GestureScript::Step& step : steps) {
+        const std::uint64_t start = nextTicks();
         switch (step.action) {
         case Action::Idle: idle(step.durationMs, kSensorNoise); break;
-        case Action::Noise: idle(step.durationMs, kHeavyNoise); break;
-        case Action::Reset: resetReport(); break;
+        case Action::Noise:
+            idle(step.durationMs, step.noise.value_or(kHeavyNoise));
+            tellTruth(TruthRecord::Kind::Noise, step, start, nextTicks());
+            break;
+        case Action::Reset:
+            resetReport();
+            tellTruth(TruthRecord::Kind::Reset, step, start, start);
+            break;
         case Action::Tap:
         case Action::Hold:
         case Action::Slide:
@@ -53,6 +64,31 @@ void Synthesizer::synthesize(const std::vector<GestureScript::Step>& steps, cons
         }
     }
     _sink = nullptr;
+    _truth = nullptr;
+}
+
+std::uint64_t Synthesizer::nextTicks() const
+{
+    return VeltoTouch::Util::machTimeFromNanoseconds(kRecordingOriginNs +
+                                                     static_cast<std::uint64_t>(_timeMs - 1000) * 1'000'000u);
+}
+
+void Synthesizer::tellTruth(TruthRecord::Kind kind, const GestureScript::Step& step, std::uint64_t start,
+                            std::uint64_t end)
+{
+    if (!_truth) return;
+    TruthRecord record;
+    record.kind = kind;
+    // The recogniser's regions and the gesture regions are numbered alike.
+    const auto region = [](VeltoTouch::PixelRegion r) { return static_cast<TruthRecord::Region>(static_cast<int>(r)); };
+    record.region = region(step.from);
+    record.to = region(step.to);
+    if (kind != TruthRecord::Kind::Tap && kind != TruthRecord::Kind::Hold && kind != TruthRecord::Kind::Slide) {
+        record.region = record.to = TruthRecord::Region::None;
+    }
+    record.start = start;
+    record.end = end;
+    (*_truth)(record);
 }
 
 void Synthesizer::idle(std::uint32_t durationMs, double noise)
@@ -73,8 +109,14 @@ void Synthesizer::touch(const GestureScript::Step& step)
     // A reset time that rounds to the end of the touch is still within it: it
     // comes before the last frame rather than not at all.
     const std::uint32_t resetFrame = step.resetAtMs ? std::min(frameCount(*step.resetAtMs), frames - 1) : kNoReset;
+    const std::uint64_t start = nextTicks();
+    std::uint64_t resetTicks = 0;
+    const double noise = step.noise.value_or(kSensorNoise);
     for (std::uint32_t i = 0; i < frames; ++i) {
-        if (resetFrame == i) resetReport();
+        if (resetFrame == i) {
+            resetTicks = nextTicks();
+            resetReport();
+        }
         // Pressure ramps up at the start and down at the end of the touch.
         const double pressure = std::min({1.0, (i + 1.0) / rise, (frames - i) / static_cast<double>(fall)});
         ContactModel::Contact contact;
@@ -82,11 +124,21 @@ void Synthesizer::touch(const GestureScript::Step& step)
             contact = ContactModel::palm(pressure);
         } else {
             const double progress = frames > 1 ? static_cast<double>(i) / (frames - 1) : 0.0;
-            const ContactModel::Point centre{from.x + (to.x - from.x) * progress, from.y + (to.y - from.y) * progress};
+            const ContactModel::Point centre{from.x + (to.x - from.x) * progress + step.offsetX,
+                                             from.y + (to.y - from.y) * progress + step.offsetY};
             contact = ContactModel::finger(centre, pressure);
         }
-        appendImage(_model.read(contact, kSensorNoise));
+        contact.radius *= step.sizeScale;
+        contact.strength *= step.strengthScale;
+        appendImage(_model.read(contact, noise));
     }
+    const TruthRecord::Kind kind = step.action == Action::Tap    ? TruthRecord::Kind::Tap
+                                   : step.action == Action::Hold ? TruthRecord::Kind::Hold
+                                   : step.action == Action::Palm ? TruthRecord::Kind::Palm
+                                                                 : TruthRecord::Kind::Slide;
+    // The touch is gone with the first frame after its last.
+    tellTruth(kind, step, start, nextTicks());
+    if (resetFrame != kNoReset) tellTruth(TruthRecord::Kind::Reset, step, resetTicks, resetTicks);
 }
 
 void Synthesizer::resetReport()

@@ -2,6 +2,7 @@
 
 #include "ContactModel.h"
 #include "GestureScript.h"
+#include "evaluation/TruthRecord.h"
 #include "recording/PipelineRecording.h"
 
 #include <cstdint>
@@ -28,12 +29,15 @@ public:
     static constexpr double kHeavyNoise = 25.0;
 
     using FrameSink = std::function<void(const VeltoTouch::PipelineRecording::Frame&)>;
+    // The truth of each touch, noise and reset, in the order they begin.
+    using TruthSink = std::function<void(const VeltoTouch::TruthRecord&)>;
 
     Synthesizer(std::uint32_t framePeriodMs, std::uint32_t seed);
 
     // Hands each frame to `sink` as soon as it is made, so that a script of
     // any length is synthesised in constant memory.
-    void synthesize(const std::vector<GestureScript::Step>& steps, const FrameSink& sink);
+    void synthesize(const std::vector<GestureScript::Step>& steps, const FrameSink& sink,
+                    const TruthSink& truth = {});
     // The whole recording at once, for short scripts.
     VeltoTouch::PipelineRecording synthesize(const std::vector<GestureScript::Step>& steps);
 
@@ -41,6 +45,10 @@ private:
     void idle(std::uint32_t durationMs, double noise);
     void touch(const GestureScript::Step& step);
     void resetReport();
+    void tellTruth(VeltoTouch::TruthRecord::Kind kind, const GestureScript::Step& step, std::uint64_t start,
+                   std::uint64_t end);
+    // The host clock ticks at which the next report will be stamped.
+    std::uint64_t nextTicks() const;
     void appendImage(const ContactModel::Readings& readings);
     void appendReport(std::vector<std::uint8_t> report);
     std::uint32_t frameCount(std::uint32_t durationMs) const;
@@ -48,6 +56,7 @@ private:
     std::uint32_t _framePeriodMs;
     ContactModel _model;
     const FrameSink* _sink = nullptr;
+    const TruthSink* _truth = nullptr;
     std::uint32_t _frameNumber = 1;
     std::uint32_t _timeMs = 1000;
 };

@@ -1,0 +1,39 @@
+#pragma once
+
+#include <ostream>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace VeltoTool {
+
+// `veltotouch eval FILE...`: replays recordings, matches their gestures to
+// the truth written by `synth --truth`, and prints how well the recogniser
+// did (a confusion table, precision and recall and latency per class), or,
+// with --sweep, one row per setting of a grid. With --merge the FILEs are
+// reports written by `eval --json` (of shards) and are added up instead.
+class EvalCommand {
+public:
+    struct Options {
+        std::vector<std::string> files;
+        // "auto" (TruthRecord::pathBeside of each recording) or one truth file
+        // for a single recording.
+        std::string truth = "auto";
+        // KEY and JSON text, applied before every replay.
+        std::vector<std::pair<std::string, std::string>> settings;
+        // KEY=FROM:TO:STEP each.
+        std::vector<std::string> sweeps;
+        // 0: all cores.
+        unsigned workers = 0;
+        // "I/N" or empty.
+        std::string shard;
+        bool merge = false;
+        bool json = false;
+    };
+
+    // Returns the exit status: 2 for options that do not go together, 0
+    // otherwise; throws ToolError (or the recording's error) on failure.
+    static int run(const Options& options, std::ostream& out, std::ostream& err);
+};
+
+}  // namespace VeltoTool
