@@ -1,0 +1,88 @@
+#include "evaluation/CorpusEvaluator.h"
+#include "evaluation/CorpusShard.h"
+#include "evaluation/EvaluationReport.h"
+#include "evaluation/SweepGrid.h"
+
+#include <gtest/gtest.h>
+
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+using namespace VeltoTouch;
+
+namespace {
+
+// The sample recordings, synthesised with their truth beside them.
+std::vector<CorpusEvaluator::Item> examples()
+{
+    std::vector<CorpusEvaluator::Item> corpus;
+    for (const auto& entry : std::filesystem::directory_iterator(VELTO_EXAMPLES_DIR)) {
+        const std::string path = entry.path().string();
+        if (entry.path().extension() != ".json") continue;
+        std::ifstream in(TruthRecord::pathBeside(path));
+        std::ostringstream text;
+        text << in.rdbuf();
+        corpus.push_back({path, TruthRecord::parseLines(text.str())});
+    }
+    std::sort(corpus.begin(), corpus.end(), [](const auto& a, const auto& b) { return a.recording < b.recording; });
+    return corpus;
+}
+
+PipelineRecording load(const std::string& path)
+{
+    std::ifstream in(path);
+    std::ostringstream text;
+    text << in.rdbuf();
+    return PipelineRecording(std::string_view(text.str()));
+}
+
+}  // namespace
+
+TEST(CorpusEvaluator, SweepRowsEqualSeparateEvaluations)
+{
+    const auto corpus = examples();
+    ASSERT_GE(corpus.size(), 6u);
+    const auto grid = SweepGrid::combinations({SweepGrid::parseAxis("Algs.HoldTimeoutMilliseconds=150:750:300"),
+                                               SweepGrid::parseAxis("Algs.ActivationThreshold=100:200:100")});
+    ASSERT_EQ(grid.size(), 6u);
+    std::size_t progressCalls = 0;
+    const auto rows = CorpusEvaluator::run(corpus, grid, 2, load, [&](std::size_t done, std::size_t total) {
+        EXPECT_EQ(done, ++progressCalls);
+        EXPECT_EQ(total, corpus.size() * grid.size());
+    });
+    ASSERT_EQ(rows.size(), grid.size());
+    EXPECT_EQ(progressCalls, corpus.size() * grid.size());
+    for (std::size_t i = 0; i < grid.size(); ++i) {
+        EXPECT_EQ(rows[i], CorpusEvaluator::run(corpus, {grid[i]}, 1, load).front()) << grid[i][0].text();
+        EXPECT_EQ(rows[i].recordings, corpus.size());
+    }
+    // The settings reach the pipeline: the hold timeout moves the result.
+    EXPECT_NE(rows[0], rows[4]);
+}
+
+TEST(CorpusEvaluator, ShardsMergedEqualOneRun)
+{
+    const auto corpus = examples();
+    const auto grid = SweepGrid::combinations({SweepGrid::parseAxis("Algs.HoldTimeoutMilliseconds=300:700:400")});
+    const auto reportOf = [&](const CorpusShard& shard) {
+        std::vector<CorpusEvaluator::Item> part;
+        for (std::size_t i = 0; i < corpus.size(); ++i) {
+            if (shard.contains(i)) part.push_back(corpus[i]);
+        }
+        EvaluationReport report;
+        report.sweepKeys = {"Algs.HoldTimeoutMilliseconds"};
+        const auto results = CorpusEvaluator::run(part, grid, 2, load);
+        for (std::size_t i = 0; i < grid.size(); ++i) report.rows.push_back({grid[i], results[i]});
+        // Shards meet as the JSON an array job leaves behind.
+        return EvaluationReport::fromJson(nlohmann::json::parse(report.toJson().dump()));
+    };
+    EvaluationReport merged = reportOf(CorpusShard::parse("0/4"));
+    for (const char* shard : {"1/4", "2/4", "3/4"}) merged.merge(reportOf(CorpusShard::parse(shard)));
+    EXPECT_EQ(merged, reportOf(CorpusShard{}));
+    EXPECT_EQ(merged.rows.front().result.recordings, corpus.size());
+
+    EvaluationReport other = reportOf(CorpusShard::parse("0/4"));
+    other.rows.front().sweep.front().value = 301;
+    EXPECT_THROW(merged.merge(other), std::invalid_argument);
+}

@@ -1,0 +1,69 @@
+#include "ToolTestSupport.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <string>
+
+using namespace VeltoTool::Testing;
+
+TEST(EvalCommand, SynthesisedCorpusOfEveryKindRecallsEveryCleanTapAndHold)
+{
+    TempDir dir;
+    const std::string scripts[] = {
+        "tap top; idle 400ms; tap middle; idle 400ms; tap bottom 80ms; idle 400ms; tap top 200ms",
+        "hold top 1s; idle 300ms; hold middle 1.5s; idle 300ms; hold bottom 700ms; palm 1.2s; tap middle",
+        "slide top bottom 900ms; noise 500ms; tap bottom; reset; hold middle 2s; slide bottom middle 800ms",
+    };
+    std::vector<std::string> arguments = {"eval", "--json", "-j", "2"};
+    for (std::size_t i = 0; i < std::size(scripts); ++i) {
+        const std::string recording = dir.file("corpus" + std::to_string(i) + ".json").string();
+        const ToolRun synth = runTool({"synth", scripts[i], "-o", recording, "--truth", "auto", "--seed", std::to_string(i + 3)});
+        ASSERT_EQ(synth.status, 0) << synth.err;
+        arguments.push_back(recording);
+    }
+    const ToolRun eval = runTool(arguments);
+    ASSERT_EQ(eval.status, 0) << eval.err;
+    const nlohmann::json report = nlohmann::json::parse(eval.out);
+    EXPECT_EQ(report["recordings"], 3);
+    for (const char* kind : {"tap", "hold", "slide", "palm", "noise", "reset"}) {
+        EXPECT_GT(report["classes"][kind]["truths"].get<int>(), 0) << kind;
+    }
+    EXPECT_EQ(report["classes"]["tap"]["truths"], 6);
+    EXPECT_EQ(report["classes"]["tap"]["recall"], 1.0);
+    EXPECT_EQ(report["classes"]["hold"]["truths"], 4);
+    EXPECT_EQ(report["classes"]["hold"]["recall"], 1.0);
+}
+
+TEST(EvalCommand, RefusesWhatItCannotDoInOneLine)
+{
+    TempDir dir;
+    const std::string recording = dir.file("taps.json").string();
+    ASSERT_EQ(runTool({"synth", "tap top", "-o", recording}).status, 0);
+    const std::string truth = dir.file("taps.truth.jsonl", "{\"kind\":\"tap\",\"region\":\"top\",\"start\":5}\n").string();
+    struct Case {
+        std::vector<std::string> arguments;
+        int status;
+        std::string says;
+    };
+    const Case cases[] = {
+        {{"eval", recording, "--sweep", "Algs.HoldTimeoutMilliseconds=300:700"}, 2, "KEY=FROM:TO:STEP"},
+        {{"eval", recording, "--sweep", "Algs.HoldTimeoutMilliseconds=700:300:100"}, 2, "TO must not be less than FROM"},
+        {{"eval", recording, "--sweep", "=1:2:1"}, 2, "KEY=FROM:TO:STEP"},
+        {{"eval", recording, "--shard", "3/3"}, 2, "0 <= I < N"},
+        {{"eval", recording, recording, "--truth", truth}, 2, "--truth PATH"},
+        {{"eval", "--merge", recording, "--sweep", "A=1:2:1"}, 2, "--merge"},
+        {{"eval", recording, "--truth", (dir.path() / "absent.jsonl").string()}, 1, "no truth for " + recording},
+        {{"eval", recording}, 1, "taps.truth.jsonl: truth line 1: \"end\" must be a whole number of ticks"},
+        {{"eval", "--merge", truth}, 1, "\"settings\" is missing"},
+        {{"eval", "--merge", dir.file("script.txt", "tap top").string()}, 1, "not JSON"},
+        {{"synth", "-o", recording}, 1, "SCRIPT or --random"},
+    };
+    for (const Case& c : cases) {
+        const ToolRun run = runTool(c.arguments);
+        EXPECT_EQ(run.status, c.status) << c.arguments[1] << " " << run.err;
+        EXPECT_NE(run.err.find(c.says), std::string::npos) << run.err;
+        EXPECT_EQ(std::count(run.err.begin(), run.err.end(), '\n'), 1) << run.err;
+        EXPECT_EQ(run.out, "");
+    }
+}
