@@ -1,0 +1,68 @@
+// bench-libs: veltotouch_evaluation
+//
+// `eval --sweep` on a pool of workers: 8 settings over a corpus of 8
+// synthesised recordings of 30 random touches each, on 1 and on 2 workers.
+// The work should divide among the cores: on 2 workers the time should be at
+// most 0.6 of the time on 1.
+#include "evaluation/CorpusEvaluator.h"
+#include "evaluation/SweepGrid.h"
+
+#include <benchmark/benchmark.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <stdexcept>
+#include <string>
+
+namespace {
+
+using namespace VeltoTouch;
+
+std::string readFile(const std::string& path)
+{
+    std::ifstream in(path);
+    std::ostringstream text;
+    text << in.rdbuf();
+    return text.str();
+}
+
+// Made once with the built tool, removed at exit.
+const std::vector<CorpusEvaluator::Item>& corpus()
+{
+    static const std::filesystem::path dir =
+        std::filesystem::temp_directory_path() / ("veltotouch-bench-eval-" + std::to_string(::getpid()));
+    static const std::vector<CorpusEvaluator::Item> items = [] {
+        std::filesystem::create_directories(dir);
+        std::atexit([] { std::filesystem::remove_all(dir); });
+        std::vector<CorpusEvaluator::Item> out;
+        for (int seed = 1; seed <= 8; ++seed) {
+            const std::string recording = (dir / ("random" + std::to_string(seed) + ".json")).string();
+            const std::string command = std::string(VELTO_TOOL_PATH) + " synth --random 30 --seed " +
+                                        std::to_string(seed) + " -o " + recording + " --truth auto";
+            if (std::system(command.c_str()) != 0) throw std::runtime_error("synth failed: " + command);
+            out.push_back({recording, TruthRecord::parseLines(readFile(TruthRecord::pathBeside(recording)))});
+        }
+        return out;
+    }();
+    return items;
+}
+
+void BM_EvalSweep(benchmark::State& state)
+{
+    const auto& items = corpus();
+    const auto grid = SweepGrid::combinations({SweepGrid::parseAxis("Algs.HoldTimeoutMilliseconds=300:1000:100")});
+    const auto load = [](const std::string& path) { return PipelineRecording(std::string_view(readFile(path))); };
+    for (auto _ : state) {
+        auto results = CorpusEvaluator::run(items, grid, static_cast<unsigned>(state.range(0)), load);
+        benchmark::DoNotOptimize(results);
+    }
+    state.counters["settings"] = static_cast<double>(grid.size());
+}
+BENCHMARK(BM_EvalSweep)->ArgName("workers")->Arg(1)->Arg(2)->UseRealTime()->Unit(benchmark::kMillisecond);
+
+}  // namespace
+
+BENCHMARK_MAIN();
