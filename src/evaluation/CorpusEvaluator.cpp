@@ -40,9 +40,23 @@ std::vector<EvaluationResult> CorpusEvaluator::run(const std::vector<Item>& corp
     std::mutex progressMutex;
     std::size_t done = 0;
 
+    const std::size_t threads = std::clamp<std::size_t>(workers, 1, std::max<std::size_t>(total, 1));
+    // Tasks run in groups of as many recordings as there are workers, setting
+    // by setting within a group: the workers start on different recordings
+    // and load them side by side, where taking one recording's settings in a
+    // row would leave all but one worker waiting for its load.
+    const auto taskAt = [&](std::size_t position) {
+        const std::size_t group = position / (threads * perRecording);
+        const std::size_t first = group * threads;
+        const std::size_t size = std::min(threads, corpus.size() - first);
+        const std::size_t offset = position - first * perRecording;
+        return std::make_pair(first + offset % size, offset / size);
+    };
+
     const auto work = [&] {
-        for (std::size_t task = next++; task < total && !failed; task = next++) {
-            const std::size_t r = task / perRecording;
+        for (std::size_t position = next++; position < total && !failed; position = next++) {
+            const auto [r, setting] = taskAt(position);
+            const std::size_t task = r * perRecording + setting;
             LoadedRecording& slot = loaded[r];
             try {
                 std::shared_ptr<const PipelineRecording> recording;
@@ -51,7 +65,7 @@ std::vector<EvaluationResult> CorpusEvaluator::run(const std::vector<Item>& corp
                     if (!slot.recording) slot.recording = std::make_shared<const PipelineRecording>(load(corpus[r].recording));
                     recording = slot.recording;
                 }
-                const auto replay = RecordingReplay::run(recording->frames(), settings[task % perRecording]);
+                const auto replay = RecordingReplay::run(recording->frames(), settings[setting]);
                 taskResults[task] = TruthMatcher::match(corpus[r].truth, replay);
             } catch (...) {
                 failures[task] = std::current_exception();
@@ -68,14 +82,14 @@ std::vector<EvaluationResult> CorpusEvaluator::run(const std::vector<Item>& corp
         }
     };
 
-    const unsigned threads = static_cast<unsigned>(std::clamp<std::size_t>(workers, 1, std::max<std::size_t>(total, 1)));
     if (threads == 1) {
         work();
     } else {
         std::vector<std::jthread> pool;
-        for (unsigned i = 0; i < threads; ++i) pool.emplace_back(work);
+        for (std::size_t i = 0; i < threads; ++i) pool.emplace_back(work);
     }
 
+    // In task order, so that the failure reported does not depend on scheduling.
     for (const std::exception_ptr& failure : failures) {
         if (failure) std::rethrow_exception(failure);
     }

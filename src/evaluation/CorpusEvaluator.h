@@ -13,13 +13,13 @@
 namespace VeltoTouch {
 
 // Evaluates a corpus of recordings once per setting on a pool of worker
-// threads. The work is one task per recording and setting, taken in
-// recording order, so that the workers share the settings of one recording
-// and each recording is loaded once and dropped when its last setting is
-// done: memory holds about as many recordings as there are workers, not the
+// threads. The work is one task per recording and setting; each recording is
+// loaded by the first task that needs it and dropped when its last setting is
+// done, and the tasks run a group of recordings (one per worker) at a time,
+// so memory holds about as many recordings as there are workers, not the
 // corpus. Each task replays through a fresh pipeline of its own. The results
-// are added up in task order, so they do not depend on the number of workers
-// or on how the threads were scheduled.
+// are added up in recording order, so they do not depend on the number of
+// workers or on how the threads were scheduled.
 class CorpusEvaluator {
 public:
     struct Item {
