@@ -7,6 +7,7 @@
 #include "evaluation/CorpusShard.h"
 #include "evaluation/EvaluationReport.h"
 #include "evaluation/SweepGrid.h"
+#include "pipeline/Pipeline.h"
 #include "recording/JsonValue.h"
 
 #include <nlohmann/json.hpp>
@@ -64,12 +65,20 @@ std::vector<TruthRecord> readTruth(const std::string& path, const std::string& r
     }
 }
 
-PipelineSettings settingsOf(const EvalCommand::Options& options)
+// As replay does, each setting is tried on a pipeline and read back, so that
+// one the pipeline converted (a string stored as 0) is told before it skews
+// the whole evaluation.
+PipelineSettings settingsOf(const EvalCommand::Options& options, std::ostream& err)
 {
     PipelineSettings settings;
+    VeltoTouch::Pipeline pipeline;
     for (const auto& [key, text] : options.settings) {
-        const nlohmann::ordered_json value = VeltoTouch::JsonValue::toJson(StateArguments::parseValue(key, text));
-        settings.push_back({key, nlohmann::json::parse(value.dump())});
+        const VeltoHost::PropertyValue value = StateArguments::parseValue(key, text);
+        pipeline.setState(key, value);
+        if (auto warning = StateArguments::readBackWarning(key, value, pipeline.getState(key))) {
+            err << "veltotouch: warning: " << *warning << '\n';
+        }
+        settings.push_back({key, nlohmann::json::parse(VeltoTouch::JsonValue::toJson(value).dump())});
     }
     return settings;
 }
@@ -240,7 +249,7 @@ int EvalCommand::run(const Options& options, std::ostream& out, std::ostream& er
     }
 
     EvaluationReport report;
-    report.settings = settingsOf(options);
+    report.settings = settingsOf(options, err);
     std::vector<VeltoTouch::SweepGrid::Axis> axes;
     for (const std::string& sweep : options.sweeps) {
         axes.push_back(VeltoTouch::SweepGrid::parseAxis(sweep));
