@@ -67,3 +67,22 @@ TEST(EvalCommand, RefusesWhatItCannotDoInOneLine)
         EXPECT_EQ(run.out, "");
     }
 }
+
+TEST(EvalCommand, RandomScriptsCoverEveryKindAndRepeatWithTheirSeed)
+{
+    TempDir dir;
+    const auto synth = [&](const std::string& name, const char* seed) {
+        const std::string recording = dir.file(name + ".json").string();
+        const ToolRun run = runTool({"synth", "--random", "60", "--seed", seed, "-o", recording, "--truth", "auto"});
+        EXPECT_EQ(run.status, 0) << run.err;
+        return std::make_pair(readFile(recording), readFile(dir.path() / (name + ".truth.jsonl")));
+    };
+    const auto first = synth("first", "11");
+    EXPECT_EQ(synth("again", "11"), first);
+    EXPECT_NE(synth("other", "12").second, first.second);
+    for (const char* kind : {"tap", "hold", "slide", "palm", "noise", "reset"}) {
+        EXPECT_NE(first.second.find(std::string("{\"kind\":\"") + kind + "\""), std::string::npos) << kind;
+    }
+    // One line per touch.
+    EXPECT_EQ(std::count(first.second.begin(), first.second.end(), '\n'), 60);
+}
