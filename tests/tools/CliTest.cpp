@@ -35,7 +35,7 @@ TEST(Cli, UsageErrorsExitWithTwoAndOneLineThatNamesTheProblem)
     };
     const Case cases[] = {
         {{}, "A subcommand is required"},
-        {{"frobnicate"}, "no command \"frobnicate\" (replay, synth, dump, host, daemon, ctl, report, help)"},
+        {{"frobnicate"}, "no command \"frobnicate\" (replay, synth, eval, dump, host, daemon, ctl, report, help)"},
         {{"replay"}, "FILE is required"},
         {{"synth", "tap top"}, "--output is required"},
         {{"replay", kTaps, "--speed", "nan"}, "--speed: expected a finite number, got nan"},
