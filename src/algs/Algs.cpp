@@ -128,7 +128,7 @@ void Algs::processTouchFrame(const Readings& readings, unsigned int frameNumber,
 void Algs::updatePixels(const Readings& readings)
 {
     for (std::size_t pad = 0; pad < readings.size(); ++pad) {
-        pixels.at(pad).updatePixelState(readings[pad], handStats.activationThreshold);
+        pixels[pad].updatePixelState(readings[pad], handStats.activationThreshold);
     }
 }
 
@@ -136,8 +136,8 @@ void Algs::updateVirtualPixels()
 {
     for (std::size_t group = 0; group < virtualImage.groups.size(); ++group) {
         // The group sum travels as a pad reading would: a signed 16-bit number.
-        const auto raw = static_cast<std::int16_t>(virtualImage.values.at(group));
-        virtualPixels.at(group).updatePixelState(raw, handStats.activationThreshold, virtualImage.maxIndex.at(group));
+        const auto raw = static_cast<std::int16_t>(virtualImage.values[group]);
+        virtualPixels[group].updatePixelState(raw, handStats.activationThreshold, virtualImage.maxIndex[group]);
     }
 }
 

@@ -22,8 +22,13 @@ void Pixel::updatePixelState(int raw, float activationThreshold)
     // is off must climb well above its lowest level since release. Together
     // these ride out slow baseline drift without chattering at the threshold.
     // A floor quotient that is not a number leaves the threshold at 1.0.
-    const double reactivation = floorRatio / static_cast<float>(kHysteresis);
-    const double threshold = active ? peakRatio * kHysteresis : (reactivation > 1.0 ? reactivation : 1.0);
+    double threshold = 0.0;
+    if (active) {
+        threshold = peakRatio * kHysteresis;
+    } else {
+        const double reactivation = floorRatio / static_cast<float>(kHysteresis);
+        threshold = reactivation > 1.0 ? reactivation : 1.0;
+    }
 
     ratio = static_cast<float>(value) / activationThreshold;
     active = ratio > threshold;
