@@ -30,6 +30,10 @@ VirtualImage::VirtualImage()
     maxIndex.reserve(kGroupCount);
     normalizationFactors.reserve(kGroupCount);
     for (std::size_t j = 0; j < kGroupCount; ++j) {
+        GroupPads& members = _groupPads[j];
+        for (char letter : kGroupNames[j]) {
+            members.pads[members.count++] = static_cast<std::int8_t>(padIndexOfLetter(letter));
+        }
         maxIndex.push_back(padIndexOfLetter(groups[j].front()));
         values.push_back(0);
         normalizationFactors.push_back(kNormalizationFactors[j]);
@@ -38,14 +42,15 @@ VirtualImage::VirtualImage()
 
 void VirtualImage::updateValues(const std::vector<Pixel>& pixels)
 {
-    // Runs every frame: the groups name pads of the fixed layout (A to O),
-    // so indexing needs no range checks.
+    // Runs every frame: the groups' pads of the fixed layout (A to O) are
+    // looked up once, at construction, and need no range checks here.
     const Pixel* pads = pixels.data();
-    for (std::size_t j = 0; j < groups.size(); ++j) {
+    for (std::size_t j = 0; j < kGroupCount; ++j) {
         std::int32_t sum = 0;
         std::int32_t& strongest = maxIndex[j];
-        for (char letter : groups[j]) {
-            const int pad = padIndexOfLetter(letter);
+        const GroupPads& members = _groupPads[j];
+        for (std::size_t m = 0; m < members.count; ++m) {
+            const int pad = members.pads[m];
             const std::int32_t padValue = pads[pad].value;
             if (padValue <= Pixel::kNoiseLevel) continue;
             sum += padValue;

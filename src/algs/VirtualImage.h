@@ -2,6 +2,7 @@
 
 #include "algs/Pixel.h"
 
+#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <string>
@@ -25,6 +26,14 @@ public:
     std::vector<std::string> groups;
     std::vector<std::int32_t> maxIndex;
     std::vector<float> normalizationFactors;
+
+private:
+    // The pads of each group as indices, in the order of its letters.
+    struct GroupPads {
+        std::array<std::int8_t, 4> pads{};
+        std::size_t count = 0;
+    };
+    std::array<GroupPads, kGroupCount> _groupPads{};
 };
 
 }  // namespace VeltoTouch
