@@ -73,13 +73,24 @@ const CLI::Validator& speedCheck()
     return check;
 }
 
+// The tool's commands in the order they were added, "replay, synth, ...",
+// for the messages about a word that is none of them.
+std::string commandNames(const CLI::App& app, const CLI::App* leftOut = nullptr)
+{
+    std::string names;
+    for (const CLI::App* command : app.get_subcommands([&](const CLI::App* c) { return c != leftOut; })) {
+        names += (names.empty() ? "" : ", ") + command->get_name();
+    }
+    return names;
+}
+
 // One line, whatever CLI11 wrote, and where to read more.
 std::string usageLine(const CLI::App& app, const CLI::ParseError& error, int argc, const char* const* argv)
 {
     std::string message = error.what();
     // CLI11 takes a word that is no command for a missing command.
     if (app.get_subcommands().empty() && argc > 1 && argv[1][0] != '-') {
-        message = std::string("no command \"") + argv[1] + "\" (replay, synth, eval, dump, host, daemon, ctl, report, help)";
+        message = std::string("no command \"") + argv[1] + "\" (" + commandNames(app) + ")";
     }
     std::replace(message.begin(), message.end(), '\n', ' ');
     std::string help = "veltotouch help";
@@ -277,7 +288,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             return command->get_name() == helpTopic && command != helpCommand;
         });
         if (commands.empty()) {
-            err << "veltotouch: help: no command \"" << helpTopic << "\" (replay, synth, eval, dump, host, daemon, ctl, report)\n";
+            err << "veltotouch: help: no command \"" << helpTopic << "\" (" << commandNames(app, helpCommand) << ")\n";
             return kUsageError;
         }
         out << commands.front()->help("veltotouch");

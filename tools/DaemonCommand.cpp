@@ -1,6 +1,5 @@
 #include "DaemonCommand.h"
 
-#include "ToolError.h"
 #include "host/Daemon.h"
 #include "host/JournalLogSink.h"
 #include "host/PluginLocator.h"
@@ -46,12 +45,7 @@ int DaemonCommand::run(const Options& options)
             daemon.devicePaths.push_back(device);
         }
     }
-    daemon.pluginPath = options.plugin;
-    if (daemon.pluginPath.empty()) {
-        const PluginLocator::Result found = PluginLocator::find();
-        if (found.path.empty()) throw ToolError(PluginLocator::notFoundMessage(found));
-        daemon.pluginPath = found.path;
-    }
+    daemon.pluginPath = PluginLocator::chosenOrFound(options.plugin);
     setLogging(daemon.config);
 
     std::unique_ptr<DeviceWatcher> watcher;

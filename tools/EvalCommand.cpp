@@ -65,19 +65,16 @@ std::vector<TruthRecord> readTruth(const std::string& path, const std::string& r
     }
 }
 
-// As replay does, each setting is tried on a pipeline and read back, so that
-// one the pipeline converted (a string stored as 0) is told before it skews
-// the whole evaluation.
+// The settings as each evaluation applies them. They are tried on a
+// pipeline first, as replay applies them, so that one the pipeline converted
+// (a string stored as 0) is told before it skews the whole evaluation.
 PipelineSettings settingsOf(const EvalCommand::Options& options, std::ostream& err)
 {
-    PipelineSettings settings;
     VeltoTouch::Pipeline pipeline;
+    StateArguments::apply(pipeline, options.settings, err);
+    PipelineSettings settings;
     for (const auto& [key, text] : options.settings) {
         const VeltoHost::PropertyValue value = StateArguments::parseValue(key, text);
-        pipeline.setState(key, value);
-        if (auto warning = StateArguments::readBackWarning(key, value, pipeline.getState(key))) {
-            err << "veltotouch: warning: " << *warning << '\n';
-        }
         settings.push_back({key, nlohmann::json::parse(VeltoTouch::JsonValue::toJson(value).dump())});
     }
     return settings;

@@ -95,14 +95,6 @@ Device openDevice(const std::string& name)
     return device;
 }
 
-std::string pluginPath(const std::string& chosen)
-{
-    if (!chosen.empty()) return chosen;
-    VeltoHost::PluginLocator::Result found = VeltoHost::PluginLocator::find();
-    if (found.path.empty()) throw ToolError(VeltoHost::PluginLocator::notFoundMessage(found));
-    return found.path;
-}
-
 }  // namespace
 
 int HostCommand::run(const Options& options, std::ostream& out, std::ostream& err)
@@ -110,7 +102,7 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
     // Before any slow work: a stop from here on ends the run in order.
     StopSignals signals;
 
-    const std::string plugin = pluginPath(options.plugin);
+    const std::string plugin = VeltoHost::PluginLocator::chosenOrFound(options.plugin);
     // Opened before the first report: a session is never played only to find
     // at the end that its recording cannot be saved.
     std::ofstream savedRecording;

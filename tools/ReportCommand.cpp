@@ -27,10 +27,6 @@ void ReportCommand::run(const Options& options, std::ostream& err)
     // A bad output path fails before the replay; a recording that turns out
     // bad leaves no page behind.
     const ToolFiles::File recording = ToolFiles::openRecording(options.file);
-    {
-        std::ifstream container(options.file, std::ios::binary);
-        report.containerVersion = RecordingReport::containerVersion(container);
-    }
     std::ofstream out = ToolFiles::create(options.output);
     report.source = std::filesystem::path(options.file).filename().string();
     report.title = options.title.empty() ? report.source : options.title;
@@ -42,7 +38,7 @@ void ReportCommand::run(const Options& options, std::ostream& err)
     try {
         page = RecordingReport::html(
             [&](const std::function<void(VeltoTouch::PipelineRecording::Frame&&)>& play) {
-                ToolFiles::streamRecording(recording.get(), options.file, play);
+                return *ToolFiles::streamRecording(recording.get(), options.file, play);
             },
             pipeline, report);
     } catch (...) {

@@ -139,17 +139,18 @@ ToolFiles::File ToolFiles::openRecording(const std::string& path)
     return file;
 }
 
-bool ToolFiles::streamRecording(std::FILE* file, const std::string& path,
-                                const VeltoTouch::ContainerStream::FrameHandler& onFrame,
-                                const std::function<bool()>& stopRequested)
+std::optional<std::uint64_t> ToolFiles::streamRecording(std::FILE* file, const std::string& path,
+                                                        const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+                                                        const std::function<bool()>& stopRequested)
 {
+    std::uint64_t version = 0;
     try {
         // Read through the descriptor: stdio's buffer is never used.
-        VeltoTouch::ContainerStream::read(::fileno(file), onFrame, stopRequested);
+        version = VeltoTouch::ContainerStream::read(::fileno(file), onFrame, stopRequested);
     } catch (const ToolError&) {
         throw;
     } catch (const std::exception& error) {
-        if (stopRequested && stopRequested()) return false;
+        if (stopRequested && stopRequested()) return std::nullopt;
         const std::string message = error.what();
         std::error_code sizeError;
         const std::uintmax_t size = std::filesystem::file_size(path, sizeError);
@@ -158,13 +159,15 @@ bool ToolFiles::streamRecording(std::FILE* file, const std::string& path,
         }
         throw ToolError(describeUnreadable(path, read(path), message));
     }
-    return !(stopRequested && stopRequested());
+    if (stopRequested && stopRequested()) return std::nullopt;
+    return version;
 }
 
-void ToolFiles::streamRecording(const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame)
+std::uint64_t ToolFiles::streamRecording(const std::string& path,
+                                         const VeltoTouch::ContainerStream::FrameHandler& onFrame)
 {
     const File file = openRecording(path);
-    streamRecording(file.get(), path, onFrame);
+    return *streamRecording(file.get(), path, onFrame);
 }
 
 }  // namespace VeltoTool

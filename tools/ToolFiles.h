@@ -3,6 +3,7 @@
 #include "recording/ContainerStream.h"
 #include "recording/PipelineRecording.h"
 
+#include <cstdint>
 #include <cstdio>
 #include <fstream>
 #include <memory>
@@ -42,13 +43,14 @@ public:
     // The recording read as it arrives, each frame handed over as soon as it
     // is complete (ContainerStream), so that its length does not matter.
     // Failures as readRecording's, raised where they are reached: the frames
-    // before a fault have been handed over. Returns false when the read ended
-    // because a stop was requested (a signal that interrupts a blocked read
-    // cuts the input short).
-    static bool streamRecording(std::FILE* file, const std::string& path,
-                                const VeltoTouch::ContainerStream::FrameHandler& onFrame,
-                                const std::function<bool()>& stopRequested = {});
-    static void streamRecording(const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame);
+    // before a fault have been handed over. Returns the container's version,
+    // or nothing when the read ended because a stop was requested (a signal
+    // that interrupts a blocked read cuts the input short).
+    static std::optional<std::uint64_t> streamRecording(std::FILE* file, const std::string& path,
+                                                        const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+                                                        const std::function<bool()>& stopRequested = {});
+    static std::uint64_t streamRecording(const std::string& path,
+                                         const VeltoTouch::ContainerStream::FrameHandler& onFrame);
 
 private:
     // The whole file, read in pieces (a read interrupted by a signal goes on).

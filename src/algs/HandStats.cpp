@@ -2,6 +2,8 @@
 
 #include <algorithm>
 #include <cmath>
+#include <numeric>
+#include <utility>
 
 namespace VeltoTouch {
 
@@ -42,6 +44,32 @@ constexpr float kTapScoreOffset = 2.4116f;
 // More elements than this above noise without ever activating is a palm or a
 // wet surface, not a tap.
 constexpr int kNonActiveElementLimit = 21;
+
+// The first two pads of `pixels` stably sorted by falling maxRatio, found in
+// one pass: this runs on every frame of a touch, where a copy and a sort
+// cost more than the rest of the decision. A ratio that is not a number
+// (possible only with a threshold that is not one) makes no strict order;
+// then the sort itself decides, on the pads' positions.
+std::pair<const Pixel*, const Pixel*> strongestTwo(const std::vector<Pixel>& pixels)
+{
+    const auto byRatio = [](const Pixel& a, const Pixel& b) { return a.maxRatio > b.maxRatio; };
+    if (std::none_of(pixels.begin(), pixels.end(), [](const Pixel& pad) { return std::isnan(pad.maxRatio); })) {
+        std::size_t top = 0;
+        for (std::size_t i = 1; i < pixels.size(); ++i) {
+            if (byRatio(pixels[i], pixels[top])) top = i;
+        }
+        std::size_t second = top == 0 ? 1 : 0;
+        for (std::size_t i = second + 1; i < pixels.size(); ++i) {
+            if (i != top && byRatio(pixels[i], pixels[second])) second = i;
+        }
+        if (second < pixels.size()) return {&pixels[top], &pixels[second]};
+    }
+    std::vector<std::size_t> order(pixels.size());
+    std::iota(order.begin(), order.end(), std::size_t{0});
+    std::stable_sort(order.begin(), order.end(),
+                     [&](std::size_t a, std::size_t b) { return byRatio(pixels[a], pixels[b]); });
+    return {&pixels.at(order.at(0)), &pixels.at(order.at(1))};
+}
 
 }  // namespace
 
@@ -173,30 +201,6 @@ void HandStats::updateRegionMax(const std::vector<Pixel>& pixels)
         const float excess = static_cast<float>(pad.value) - static_cast<float>(Pixel::kNoiseLevel);
         if (excess > 0.0f && region != PixelRegion::None) regionMaxOf(region) = std::max(regionMaxOf(region), excess);
     }
-}
-
-// The first two pads of `pixels` stably sorted by falling maxRatio, found in
-// one pass: this runs on every frame of a touch, where a copy and a sort
-// cost more than the rest of the decision. A ratio that is not a number
-// (possible only with a threshold that is not one) makes no strict order, and
-// the sort itself then decides.
-std::pair<const Pixel*, const Pixel*> HandStats::strongestTwo(const std::vector<Pixel>& pixels)
-{
-    const auto byRatio = [](const Pixel& a, const Pixel& b) { return a.maxRatio > b.maxRatio; };
-    if (std::none_of(pixels.begin(), pixels.end(), [](const Pixel& pad) { return std::isnan(pad.maxRatio); })) {
-        std::size_t top = 0;
-        for (std::size_t i = 1; i < pixels.size(); ++i) {
-            if (byRatio(pixels[i], pixels[top])) top = i;
-        }
-        std::size_t second = top == 0 ? 1 : 0;
-        for (std::size_t i = second + 1; i < pixels.size(); ++i) {
-            if (i != top && byRatio(pixels[i], pixels[second])) second = i;
-        }
-        if (second < pixels.size()) return {&pixels[top], &pixels[second]};
-    }
-    _ranked = pixels;
-    std::stable_sort(_ranked.begin(), _ranked.end(), byRatio);
-    return {&_ranked.at(0), &_ranked.at(1)};
 }
 
 PixelRegion HandStats::updateActiveRegion(const std::vector<Pixel>& pixels,

@@ -7,7 +7,6 @@
 
 #include <array>
 #include <cstdint>
-#include <utility>
 #include <vector>
 
 namespace VeltoTouch {
@@ -96,9 +95,6 @@ private:
         int strongestIndex = 0;
     };
     FrameScan scanFrame(const std::vector<Pixel>& pixels, const std::vector<VirtualPixel>& virtualPixels);
-    std::pair<const Pixel*, const Pixel*> strongestTwo(const std::vector<Pixel>& pixels);
-    // Where strongestTwo sorts when it must.
-    std::vector<Pixel> _ranked;
     void scanElement(const Pixel& element, FrameScan& scan, float& strongestRatio);
     void updateEdgeTimes(std::uint32_t frameTime);
     void updateHoldDecision(std::uint32_t frameTime);

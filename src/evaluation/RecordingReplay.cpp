@@ -1,7 +1,6 @@
 #include "evaluation/RecordingReplay.h"
 
 #include "pipeline/Pipeline.h"
-#include "pipeline/Util.h"
 
 namespace VeltoTouch {
 
@@ -14,13 +13,11 @@ RecordingReplay::Outcome RecordingReplay::run(const PipelineRecording::FrameList
     pipeline.hidEventsProbe = [&](const VeltoHost::HidEventList& events) {
         for (const auto& event : events) outcome.gestures.push_back({VeltoHost::Gesture::of(*event), event->timeStamp()});
     };
+    // A clock that starts at tick 0, with the time line's origin at
+    // nanosecond 0: each frame plays at its own time stamp, without waiting.
+    PipelineRecording::PlayClock clock;
     for (const PipelineRecording::Frame& frame : frames) {
-        pipeline.setTime(Util::machTimeFromNanoseconds(frame.timestampNs));
-        if (frame.type == PipelineRecording::Frame::Type::InputReport) {
-            pipeline.handleInputReport(frame.report.data(), frame.report.size());
-        } else if (frame.type == PipelineRecording::Frame::Type::State) {
-            pipeline.setState(frame.key, frame.value);
-        }
+        PipelineRecording::playFrame(frame, clock, 0, 1.0f, {}, &pipeline);
     }
     if (!frames.empty()) outcome.durationNs = frames.back().timestampNs - frames.front().timestampNs;
     return outcome;

@@ -2,6 +2,7 @@
 
 #include <cstdlib>
 #include <filesystem>
+#include <stdexcept>
 #include <system_error>
 
 namespace VeltoHost {
@@ -84,6 +85,14 @@ std::string PluginLocator::notFoundMessage(const Result& result)
     for (std::size_t i = 0; i < result.tried.size(); ++i) text += (i ? ", " : "") + result.tried[i];
     text += std::string(" (give --plugin PATH or set ") + kEnvironmentVariable + ")";
     return text;
+}
+
+std::string PluginLocator::chosenOrFound(const std::string& chosen)
+{
+    if (!chosen.empty()) return chosen;
+    const Result found = find();
+    if (found.path.empty()) throw std::runtime_error(notFoundMessage(found));
+    return found.path;
 }
 
 }  // namespace VeltoHost

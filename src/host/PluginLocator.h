@@ -30,6 +30,10 @@ public:
 
     // One line naming every place looked at, for the error when none had it.
     static std::string notFoundMessage(const Result& result);
+
+    // `chosen` when given (--plugin), else what find() finds; raises
+    // std::runtime_error with notFoundMessage when nothing is there.
+    static std::string chosenOrFound(const std::string& chosen);
 };
 
 }  // namespace VeltoHost

@@ -1,6 +1,8 @@
 #include "recording/ContainerStream.h"
 
 #include "recording/ContainerFrames.h"
+#include "platform/PropertyDictionary.h"
+#include "recording/JsonValue.h"
 #include "recording/PropertyValueBuilder.h"
 
 #include <rapidjson/reader.h>
@@ -182,6 +184,8 @@ public:
 
     // Why the parse stopped early, if the handler stopped it.
     std::exception_ptr failure() const { return _failure; }
+    // The container's version, once read.
+    std::uint64_t version() const { return _version.value_or(0); }
 
     bool Null() { return event([&] { return scalar(PropertyValue::null()); }); }
     bool Bool(bool value) { return event([&] { return scalar(PropertyValue::boolean(value)); }); }
@@ -259,34 +263,11 @@ private:
         }
     }
 
-    // Adds a scalar to the value being built; false when the builder refuses it.
-    bool addTo(PropertyValueBuilder& builder, PropertyValue value)
-    {
-        switch (value.kind()) {
-        case PropertyValue::Kind::Null: return builder.null();
-        case PropertyValue::Kind::Boolean: return builder.boolean(value.asBoolean());
-        case PropertyValue::Kind::String: {
-            std::string text = value.asString();
-            return builder.string(text);
-        }
-        default: break;
-        }
-        using NumberType = PropertyValue::NumberType;
-        static const std::string kNoText;
-        switch (value.numberType()) {
-        case NumberType::Int32:
-        case NumberType::Int64: return builder.number_integer(value.toInt64());
-        case NumberType::UInt32:
-        case NumberType::UInt64: return builder.number_unsigned(value.toUInt64());
-        default: return builder.number_float(value.toDouble(), kNoText);
-        }
-    }
-
     bool scalar(PropertyValue value)
     {
         if (_skipUntilDepth) return true;
         if (_capture) {
-            if (!addTo(*_capture, std::move(value))) rejectContainer("invalid container");
+            if (!_capture->scalar(std::move(value))) rejectContainer("invalid container");
             if (_depth == _captureDepth) finishCapture();
             return true;
         }
@@ -300,7 +281,7 @@ private:
         case Place::Frames:
         case Place::Reports:
             beginCapture(Captured::Element, _depth);
-            if (!addTo(*_capture, std::move(value))) rejectContainer("invalid container");
+            if (!_capture->scalar(std::move(value))) rejectContainer("invalid container");
             finishCapture();
             return true;
         case Place::AfterTop: return true;
@@ -393,7 +374,7 @@ private:
         if (key == TopKey::Version) {
             if (_framesSeen) rejectContainer("invalid container");
             beginCapture(Captured::Version, _depth);
-            if (!addTo(*_capture, std::move(value))) rejectContainer("invalid container");
+            if (!_capture->scalar(std::move(value))) rejectContainer("invalid container");
             finishCapture();
             return true;
         }
@@ -493,7 +474,7 @@ private:
 
 }  // namespace
 
-void ContainerStream::read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested)
+std::uint64_t ContainerStream::read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested)
 {
     const off_t start = ::lseek(fd, 0, SEEK_CUR);
     DescriptorInput input(fd, stopRequested);
@@ -517,7 +498,7 @@ void ContainerStream::read(int fd, const FrameHandler& onFrame, const std::funct
             rejectContainer("invalid container");
         }
     }
-    if (!framesBeforeVersion) return;
+    if (!framesBeforeVersion) return handler.version();
 
     // Read whole, from the start, when the file can be read again.
     if (start < 0 || ::lseek(fd, start, SEEK_SET) != start) {
@@ -533,12 +514,15 @@ void ContainerStream::read(int fd, const FrameHandler& onFrame, const std::funct
         text.append(buffer.data(), static_cast<std::size_t>(count));
     }
     PipelineRecording recording{std::string_view(text)};
+    // Read whole, the container was valid: its version is a number.
+    const std::uint64_t version = JsonValue::parse(text).asDictionary().get(ContainerFrames::kVersionKey).toUInt64();
     text.clear();
     text.shrink_to_fit();
     for (const Frame& frame : recording.frames()) {
         Frame copy = frame;
         onFrame(std::move(copy));
     }
+    return version;
 }
 
 }  // namespace VeltoTouch

@@ -2,6 +2,7 @@
 
 #include "recording/PipelineRecording.h"
 
+#include <cstdint>
 #include <functional>
 
 namespace VeltoTouch {
@@ -31,8 +32,9 @@ public:
     // Reads from the descriptor's current position to its end; it stays
     // open. When `stopRequested` turns true, the input ends there as if it
     // had been cut short (the caller, who asked, tells a stop from a fault),
-    // also while waiting for input that has not come (a pipe).
-    static void read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested = {});
+    // also while waiting for input that has not come (a pipe). Returns the
+    // container's version (0 or 1) as it states it.
+    static std::uint64_t read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested = {});
 };
 
 }  // namespace VeltoTouch

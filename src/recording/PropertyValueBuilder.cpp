@@ -31,7 +31,7 @@ bool PropertyValueBuilder::open(bool isObject)
     return true;
 }
 
-bool PropertyValueBuilder::addScalar(PropertyValue value)
+bool PropertyValueBuilder::scalar(PropertyValue value)
 {
     if (_levels.empty() && !_scalarTopLevelAllowed) return false;
     return add(std::move(value));

@@ -31,22 +31,26 @@ public:
 
     PropertyValue takeResult() { return std::move(_result); }
 
-    bool null() { return addScalar(PropertyValue::null()); }
-    bool boolean(bool value) { return addScalar(PropertyValue::boolean(value)); }
+    bool null() { return scalar(PropertyValue::null()); }
+    bool boolean(bool value) { return scalar(PropertyValue::boolean(value)); }
     // Negative integers (and "-0").
     bool number_integer(std::int64_t value)
     {
-        return addScalar(value < 0 ? PropertyValue::int64(value) : PropertyValue::uint64(static_cast<std::uint64_t>(value)));
+        return scalar(value < 0 ? PropertyValue::int64(value) : PropertyValue::uint64(static_cast<std::uint64_t>(value)));
     }
-    bool number_unsigned(std::uint64_t value) { return addScalar(PropertyValue::uint64(value)); }
-    bool number_float(double value, const std::string&) { return addScalar(PropertyValue::float64(value)); }
-    bool string(std::string& value) { return addScalar(PropertyValue::string(std::move(value))); }
+    bool number_unsigned(std::uint64_t value) { return scalar(PropertyValue::uint64(value)); }
+    bool number_float(double value, const std::string&) { return scalar(PropertyValue::float64(value)); }
+    bool string(std::string& value) { return scalar(PropertyValue::string(std::move(value))); }
     // Only binary formats produce these; JSON text never does.
     template <typename Binary>
     bool binary(Binary&)
     {
         return false;
     }
+
+    // A scalar the caller has already made a value (a reader that keeps
+    // scalars of its own, numbers mapped as above).
+    bool scalar(PropertyValue value);
 
     bool start_object(std::size_t = 0) { return open(true); }
     bool key(std::string& key);
@@ -69,7 +73,6 @@ private:
     };
 
     bool open(bool isObject);
-    bool addScalar(PropertyValue value);
     bool add(PropertyValue value);
 
     bool _scalarTopLevelAllowed;

@@ -5,73 +5,12 @@
 
 #include <nlohmann/json.hpp>
 
-#include <istream>
 #include <string_view>
 #include <vector>
 
 namespace VeltoTouch {
 
 namespace {
-
-// Reads a container's top-level "Version" without building the document:
-// stops as soon as the value is seen.
-class VersionScanner : public nlohmann::json_sax<nlohmann::json> {
-public:
-    std::optional<std::uint64_t> version;
-
-    bool null() override { return settle(std::nullopt); }
-    bool boolean(bool value) override { return settle(value ? 1 : 0); }
-    bool number_integer(number_integer_t value) override { return settle(static_cast<std::uint64_t>(value)); }
-    bool number_unsigned(number_unsigned_t value) override { return settle(value); }
-    bool number_float(number_float_t value, const string_t&) override
-    {
-        // Only numbers a version can be are converted; the cast of others is undefined.
-        if (!(value >= 0 && value < 1e19)) return settle(std::nullopt);
-        return settle(static_cast<std::uint64_t>(value));
-    }
-    bool string(string_t&) override { return settle(std::nullopt); }
-    bool binary(binary_t&) override { return settle(std::nullopt); }
-    bool start_object(std::size_t) override
-    {
-        _wanted = false;
-        ++_depth;
-        return true;
-    }
-    bool end_object() override
-    {
-        --_depth;
-        return true;
-    }
-    bool start_array(std::size_t) override
-    {
-        _wanted = false;
-        ++_depth;
-        return true;
-    }
-    bool end_array() override
-    {
-        --_depth;
-        return true;
-    }
-    bool key(string_t& name) override
-    {
-        _wanted = _depth == 1 && name == "Version";
-        return true;
-    }
-    bool parse_error(std::size_t, const std::string&, const nlohmann::detail::exception&) override { return false; }
-
-private:
-    // A scalar: the answer when it is the top level's "Version"; false stops the scan.
-    bool settle(std::optional<std::uint64_t> value)
-    {
-        if (!_wanted) return true;
-        version = value;
-        return false;
-    }
-
-    int _depth = 0;
-    bool _wanted = false;
-};
 
 // The template with each slot replaced, in one pass over the template, so
 // that text put into one slot is never searched for another.
@@ -148,8 +87,8 @@ struct FrameCounts {
     }
 };
 
-nlohmann::ordered_json facts(const FrameCounts& counts, const RecordingReport::Options& options,
-                             std::size_t pageFrames)
+nlohmann::ordered_json facts(const FrameCounts& counts, std::uint64_t containerVersion,
+                             const RecordingReport::Options& options, std::size_t pageFrames)
 {
     const std::optional<std::uint64_t>& first = counts.first;
     const std::uint64_t last = counts.last;
@@ -161,7 +100,7 @@ nlohmann::ordered_json facts(const FrameCounts& counts, const RecordingReport::O
     out["pageFrames"] = pageFrames;
     // Nanosecond time stamps pass 2^53 too.
     out["durationNs"] = first && last >= *first ? std::to_string(last - *first) : "0";
-    out["containerVersion"] = options.containerVersion ? std::to_string(*options.containerVersion) : "unknown";
+    out["containerVersion"] = std::to_string(containerVersion);
     out["firstTimestampNs"] = first ? std::to_string(*first) : "";
     out["lastTimestampNs"] = first ? std::to_string(last) : "";
     nlohmann::ordered_json settings = nlohmann::ordered_json::array();
@@ -178,13 +117,6 @@ nlohmann::ordered_json facts(const FrameCounts& counts, const RecordingReport::O
 
 }  // namespace
 
-std::optional<std::uint64_t> RecordingReport::containerVersion(std::istream& container)
-{
-    VersionScanner scanner;
-    nlohmann::json::sax_parse(container, &scanner);
-    return scanner.version;
-}
-
 std::string RecordingReport::html(const FrameSource& frames, const std::shared_ptr<Pipeline>& pipeline,
                                   const Options& options)
 {
@@ -193,13 +125,13 @@ std::string RecordingReport::html(const FrameSource& frames, const std::shared_p
         ReportCollector collector(*pipeline, options.frames);
         FrameCounts counts;
         PipelineRecording::PlayClock clock;
-        frames([&](PipelineRecording::Frame&& frame) {
+        const std::uint64_t containerVersion = frames([&](PipelineRecording::Frame&& frame) {
             if (!counts.first) clock.reset();
             counts.add(frame);
             PipelineRecording::playFrame(frame, clock, *counts.first, 1.0f, {}, pipeline.get());
         });
         payload = collector.payload();
-        payload["facts"] = facts(counts, options, collector.frameCount());
+        payload["facts"] = facts(counts, containerVersion, options, collector.frameCount());
     }
     payload["title"] = options.title;
     payload["counters"] = countersAsText(JsonValue::toJson(pipeline->getState("Algs.EventStats")));

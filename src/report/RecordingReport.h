@@ -6,7 +6,6 @@
 
 #include <cstdint>
 #include <functional>
-#include <istream>
 #include <memory>
 #include <optional>
 #include <string>
@@ -25,27 +24,23 @@ class RecordingReport {
 public:
     struct Options {
         std::string title;
-        // Shown among the facts: where the recording came from, the version
-        // of its container, and the settings applied before the first frame.
+        // Shown among the facts: where the recording came from and the
+        // settings applied before the first frame.
         std::string source;
-        std::optional<std::uint64_t> containerVersion;
         std::vector<std::pair<std::string, std::string>> settings;
         ReportCollector::FrameRange frames;
     };
 
     // Hands every frame of a recording, in order, to the function it is given
-    // (ToolFiles::streamRecording reading a file, or a loop over a recording
-    // held in memory).
-    using FrameSource = std::function<void(const std::function<void(PipelineRecording::Frame&&)>& play)>;
+    // (ToolFiles::streamRecording reading a file) and returns the version of
+    // the recording's container, which the page shows among its facts.
+    using FrameSource =
+        std::function<std::uint64_t(const std::function<void(PipelineRecording::Frame&&)>& play)>;
 
     // Plays every frame through `pipeline` (already set up by the caller) as
     // fast as possible, as the source hands them over, and returns the page.
     static std::string html(const FrameSource& frames, const std::shared_ptr<Pipeline>& pipeline,
                             const Options& options);
-
-    // The "Version" a container states at its top level, read up to there
-    // only; empty when it has none.
-    static std::optional<std::uint64_t> containerVersion(std::istream& container);
 };
 
 }  // namespace VeltoTouch
