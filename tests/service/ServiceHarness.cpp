@@ -60,12 +60,6 @@ std::vector<DeliveredEvent> EventCollector::events() const
     return _events;
 }
 
-std::size_t EventCollector::count() const
-{
-    std::lock_guard<std::mutex> lock(_lock);
-    return _events.size();
-}
-
 ServiceHarness::ServiceHarness(bool withDevice) : _queue(SerialQueue::create("service.test.events"))
 {
     collector.setQueue(_queue);
@@ -90,10 +84,15 @@ PluginInterfaceTable& ServiceHarness::plugin() const { return **static_cast<Plug
 
 ServiceInterfaceTable& ServiceHarness::service() const { return **static_cast<ServiceInterfaceTable**>(_service); }
 
-void ServiceHarness::bringUp()
+void ServiceHarness::start()
 {
     ASSERT_EQ(plugin().Start(_plugin, PropertyValue::dictionary({}), kServiceHandle), kVeltoSuccess);
     ASSERT_TRUE(service().open(_service, 0));
+}
+
+void ServiceHarness::bringUp()
+{
+    start();
     setCallback(collector);
     schedule();
 }
@@ -133,26 +132,6 @@ bool ServiceHarness::waitForResetCount(std::uint32_t count) const
     }
     return false;
 }
-
-void ServiceHarness::setDebugReport(std::uint8_t reportID, std::vector<std::uint8_t> bytes)
-{
-    _device->setFeatureReport(reportID, std::move(bytes));
-}
-
-void ServiceHarness::setAllReportsFail(std::int32_t status) { _device->failGetReport(status); }
-
-void ServiceHarness::setDeviceProperty(const std::string& key, PropertyValue value)
-{
-    _device->setProperty(key, value);
-}
-
-PropertyValue ServiceHarness::deviceProperty(const std::string& key) const { return _device->getProperty(key); }
-
-void ServiceHarness::setDeviceAcceptsWrites(bool accepts) { _device->refusePropertyWrites(!accepts); }
-
-bool ServiceHarness::deviceIsScheduled() const { return _device->isScheduled(); }
-
-bool ServiceHarness::deviceHasCallback() const { return _device->hasCallback(); }
 
 std::vector<std::uint8_t> firmwareEventReport(std::uint8_t code, std::uint64_t context)
 {

@@ -48,7 +48,6 @@ public:
     // (a hung service must fail the test, not hang it).
     bool waitFor(std::size_t count);
     std::vector<DeliveredEvent> events() const;
-    std::size_t count() const;
 
 private:
     mutable std::mutex _lock;
@@ -75,6 +74,8 @@ public:
     VeltoHost::VeltoInterfaceRef pluginRef() const { return _plugin; }
     VeltoHost::VeltoInterfaceRef serviceRef() const { return _service; }
 
+    // start and open.
+    void start();
     // start, open, set the callback (to `collector`), schedule.
     void bringUp();
     // unschedule, close, stop.
@@ -90,15 +91,6 @@ public:
     void push(const std::vector<std::uint8_t>& report);
     // Polls the pipeline's reset counter (for reports that give no event).
     bool waitForResetCount(std::uint32_t count) const;
-
-    // The simulated device's side.
-    void setDebugReport(std::uint8_t reportID, std::vector<std::uint8_t> bytes);
-    void setAllReportsFail(std::int32_t status);
-    void setDeviceProperty(const std::string& key, VeltoHost::PropertyValue value);
-    VeltoHost::PropertyValue deviceProperty(const std::string& key) const;
-    void setDeviceAcceptsWrites(bool accepts);
-    bool deviceIsScheduled() const;
-    bool deviceHasCallback() const;
 
     const VeltoHost::SerialQueue::Ref& queue() const { return _queue; }
     const std::shared_ptr<VeltoHost::SimulatedHostDevice>& device() const { return _device; }

@@ -2,9 +2,8 @@
 // device's own keys, read and written while reports flow; and the device
 // failures that properties and start must survive.
 
-#include "platform/CaptureLogSink.h"
-#include "platform/HidEvent.h"
 #include "platform/PropertyDictionary.h"
+#include "platform/SimulatedHostDevice.h"
 #include "recording/PipelineRecording.h"
 #include "service/ServiceHarness.h"
 
@@ -19,6 +18,7 @@
 
 using namespace VeltoHost;
 using namespace VeltoTouch::Test;
+using Frame = VeltoTouch::PipelineRecording::Frame;
 
 namespace {
 
@@ -26,12 +26,34 @@ constexpr std::uint8_t kDebugReportIDs[] = {0x04, 0x10, 0x11, 0x12, 0x13, 0x1D, 
 constexpr const char* kDebugReportKeys[] = {"0x04", "0x10", "0x11", "0x12", "0x13",
                                             "0x1d", "0x32", "0x3b", "0x3c", "0x3f"};
 
-std::size_t countFrames(const VeltoTouch::PipelineRecording& recording,
-                        VeltoTouch::PipelineRecording::Frame::Type type)
+std::size_t countFrames(const VeltoTouch::PipelineRecording& recording, Frame::Type type)
 {
     std::size_t count = 0;
     for (const auto& frame : recording.frames()) count += frame.type == type;
     return count;
+}
+
+// "FirmwareDebugReports": ten entries in order, each the failure text with
+// the unpadded ID (and `status` when given), except `readable` with `text`.
+void expectFirmwareReports(const PropertyValue& reports, const char* status, std::uint8_t readable = 0,
+                           const char* text = "")
+{
+    ASSERT_TRUE(reports.isDictionary());
+    ASSERT_EQ(reports.asDictionary().size(), 10u);
+    std::size_t index = 0;
+    for (const auto& [key, value] : reports.asDictionary()) {
+        const std::uint8_t id = kDebugReportIDs[index];
+        EXPECT_EQ(key, kDebugReportKeys[index++]);
+        char failure[40];
+        std::snprintf(failure, sizeof failure, "Failed to get report ID 0x%x: 0x", id);
+        if (id == readable) {
+            EXPECT_EQ(value, PropertyValue::string(text));
+        } else if (*status) {
+            EXPECT_EQ(value, PropertyValue::string(failure + std::string(status)));
+        } else {
+            EXPECT_EQ(value.asString().rfind(failure, 0), 0u) << value.asString();
+        }
+    }
 }
 
 }  // namespace
@@ -39,9 +61,6 @@ std::size_t countFrames(const VeltoTouch::PipelineRecording& recording,
 TEST(ServiceProperties, ReadsAndWritesWhileReportsFlow)
 {
     ServiceHarness harness;
-    harness.setDebugReport(0x04, {0x04, 0xAB, 0x00});
-    harness.setDebugReport(0x1F, {0x1F, 0x10, 0x27, 0x00, 0x00});  // 10000
-    harness.setDeviceProperty("Product", PropertyValue::string("Velto Touch"));
     harness.bringUp();
 
     constexpr int kImages = 1600;
@@ -62,26 +81,12 @@ TEST(ServiceProperties, ReadsAndWritesWhileReportsFlow)
         written = 300 + static_cast<std::uint32_t>(rounds);
         EXPECT_TRUE(harness.setProperty("Pipeline.Algs.HoldTimeoutMilliseconds", PropertyValue::uint32(written)));
         EXPECT_EQ(harness.copyProperty("Pipeline.Algs.HoldTimeoutMilliseconds"), PropertyValue::uint32(written));
-
-        PropertyValue info = harness.copyProperty("Pipeline.DebugInfo");
-        ASSERT_TRUE(info.isDictionary());
-        EXPECT_TRUE(info.asDictionary().get("ResetCount").isNumber());
-
-        PropertyValue version = harness.copyProperty("Version");
-        EXPECT_EQ(version, PropertyValue::array({PropertyValue::int32(28), PropertyValue::int32(0),
-                                                 PropertyValue::int32(0)}));
+        EXPECT_TRUE(harness.copyProperty("Pipeline.DebugInfo").asDictionary().get("ResetCount").isNumber());
         PropertyValue text = harness.copyProperty("Recording");
         ASSERT_TRUE(text.isString());
         VeltoTouch::PipelineRecording recording(std::string_view(text.asString()));
-        EXPECT_LE(countFrames(recording, VeltoTouch::PipelineRecording::Frame::Type::InputReport), 1350u);
-
-        PropertyValue debug = harness.copyProperty("ServicePluginDebug");
-        ASSERT_TRUE(debug.isDictionary());
-        EXPECT_TRUE(debug.asDictionary().contains("Recording"));
-        EXPECT_TRUE(debug.asDictionary().contains("Pipeline.DebugInfo"));
-        EXPECT_EQ(harness.copyProperty("FirmwareDebugReports").asDictionary().size(), 10u);
-        EXPECT_EQ(harness.copyProperty("FactoryResetHoldDuration"), PropertyValue::uint32(10000));
-        EXPECT_EQ(harness.copyProperty("Product"), PropertyValue::string("Velto Touch"));
+        EXPECT_LE(countFrames(recording, Frame::Type::InputReport), 1350u);
+        EXPECT_TRUE(harness.copyProperty("ServicePluginDebug").asDictionary().contains("Recording"));
     }
     pusher.join();
     ASSERT_TRUE(harness.collector.waitFor(kImages / kResetEvery));
@@ -95,19 +100,21 @@ TEST(ServiceProperties, ReadsAndWritesWhileReportsFlow)
     // The last write is in the recording, keyed relative to the pipeline.
     PropertyValue text = harness.copyProperty("Recording");
     VeltoTouch::PipelineRecording recording(std::string_view(text.asString()));
-    const VeltoTouch::PipelineRecording::Frame* lastState = nullptr;
+    const Frame* lastState = nullptr;
     for (const auto& frame : recording.frames()) {
-        if (frame.type == VeltoTouch::PipelineRecording::Frame::Type::State) lastState = &frame;
+        if (frame.type == Frame::Type::State) lastState = &frame;
         EXPECT_EQ(frame.key.rfind("Pipeline", 0), std::string::npos) << frame.key;
     }
     ASSERT_NE(lastState, nullptr);
     EXPECT_EQ(lastState->key, "Algs.HoldTimeoutMilliseconds");
     EXPECT_EQ(lastState->value.toUInt64(), written);
-    EXPECT_EQ(countFrames(recording, VeltoTouch::PipelineRecording::Frame::Type::InputReport), 1350u);
+    EXPECT_EQ(countFrames(recording, Frame::Type::InputReport), 1350u);
 
     // Reading the recording does not change it; the aggregate holds exactly
     // what the separate reads give when nothing moves.
     EXPECT_EQ(harness.copyProperty("Recording"), text);
+    EXPECT_EQ(harness.copyProperty("Version"),
+              PropertyValue::array({PropertyValue::int32(28), PropertyValue::int32(0), PropertyValue::int32(0)}));
     PropertyValue debug = harness.copyProperty("ServicePluginDebug");
     const PropertyDictionary& entries = debug.asDictionary();
     for (const char* key : {"Version", "FirmwareDebugReports", "Recording", "Pipeline.DebugInfo",
@@ -121,14 +128,15 @@ TEST(ServiceProperties, ReadsAndWritesWhileReportsFlow)
 TEST(ServiceProperties, KeysAreRoutedByDomainAndName)
 {
     ServiceHarness harness;
-    harness.setDeviceProperty("Pipeline", PropertyValue::string("device's own"));
-    harness.setDeviceProperty("Recording", PropertyValue::string("stale"));
+    const SimulatedHostDevice::Ref& device = harness.device();
+    device->setProperty("Pipeline", PropertyValue::string("device's own"));
+    device->setProperty("Recording", PropertyValue::string("stale"));
     harness.bringUp();
 
     // The domain needs its dot; a bare "Pipeline" belongs to the device.
     EXPECT_EQ(harness.copyProperty("Pipeline"), PropertyValue::string("device's own"));
     // A pipeline key it does not know is null and never reaches the device.
-    harness.setDeviceProperty("Pipeline.Unknown", PropertyValue::string("device"));
+    device->setProperty("Pipeline.Unknown", PropertyValue::string("device"));
     EXPECT_FALSE(harness.copyProperty("Pipeline.Unknown").hasValue());
     EXPECT_TRUE(harness.setProperty("Pipeline.Unknown", PropertyValue::int32(1)));
     EXPECT_FALSE(harness.copyProperty("pipeline.DebugInfo").hasValue());
@@ -140,34 +148,19 @@ TEST(ServiceProperties, KeysAreRoutedByDomainAndName)
     harness.push(deviceResetReport());
     ASSERT_TRUE(harness.collector.waitFor(1));
     PropertyValue before = harness.copyProperty("Recording");
-    harness.setDeviceAcceptsWrites(true);
     EXPECT_TRUE(harness.setProperty("Recording", PropertyValue::string("x")));
-    EXPECT_EQ(harness.deviceProperty("Recording"), PropertyValue::string("x"));
+    EXPECT_EQ(device->getProperty("Recording"), PropertyValue::string("x"));
     PropertyValue after = harness.copyProperty("Recording");
     VeltoTouch::PipelineRecording kept(std::string_view(after.asString()));
     EXPECT_EQ(kept.frames().size(), 2u);  // the "Pipeline.Unknown" state and the reset report
     EXPECT_EQ(after, before);
-    harness.setDeviceAcceptsWrites(false);
+    device->refusePropertyWrites(true);
     EXPECT_FALSE(harness.setProperty("Version", PropertyValue::int32(1)));
 
     // The firmware reports: hex text for what the device has, the failure
-    // text with the unpadded ID for the rest; ten entries in any case.
-    harness.setDebugReport(0x3C, {0x3C, 0x00, 0xFF});
-    PropertyValue reports = harness.copyProperty("FirmwareDebugReports");
-    ASSERT_TRUE(reports.isDictionary());
-    ASSERT_EQ(reports.asDictionary().size(), 10u);
-    std::size_t index = 0;
-    for (const auto& [key, value] : reports.asDictionary()) {
-        EXPECT_EQ(key, kDebugReportKeys[index]);
-        if (kDebugReportIDs[index] == 0x3C) {
-            EXPECT_EQ(value, PropertyValue::string("3c 00 ff "));
-        } else {
-            char prefix[40];
-            std::snprintf(prefix, sizeof prefix, "Failed to get report ID 0x%x: 0x", kDebugReportIDs[index]);
-            EXPECT_EQ(value.asString().rfind(prefix, 0), 0u) << value.asString();
-        }
-        ++index;
-    }
+    // text for the rest.
+    device->setFeatureReport(0x3C, {0x3C, 0x00, 0xFF});
+    expectFirmwareReports(harness.copyProperty("FirmwareDebugReports"), "", 0x3C, "3c 00 ff ");
     EXPECT_FALSE(harness.copyProperty("FactoryResetHoldDuration").hasValue());
     harness.tearDown();
 }
@@ -184,9 +177,7 @@ TEST(ServiceProperties, DeviceFailuresAreSoft)
         EXPECT_FALSE(harness.service().open(harness.serviceRef(), 0));
         harness.service().close(harness.serviceRef(), 0);
 
-        PropertyValue reports = harness.copyProperty("FirmwareDebugReports");
-        ASSERT_EQ(reports.asDictionary().size(), 10u);
-        EXPECT_EQ(reports.asDictionary().get("0x04").asString().rfind("Failed to get report ID 0x4: 0x", 0), 0u);
+        expectFirmwareReports(harness.copyProperty("FirmwareDebugReports"), "");
         EXPECT_FALSE(harness.copyProperty("FactoryResetHoldDuration").hasValue());
         EXPECT_FALSE(harness.copyProperty("Product").hasValue());
         EXPECT_FALSE(harness.setProperty("Product", PropertyValue::int32(1)));
@@ -206,53 +197,14 @@ TEST(ServiceProperties, DeviceFailuresAreSoft)
     // the device's status, and no hold duration.
     {
         ServiceHarness harness;
-        harness.setAllReportsFail(static_cast<std::int32_t>(0xE00002D8u));
+        harness.device()->failGetReport(static_cast<std::int32_t>(0xE00002D8u));
         harness.bringUp();
         PropertyValue reports = harness.copyProperty("FirmwareDebugReports");
-        ASSERT_EQ(reports.asDictionary().size(), 10u);
-        std::size_t index = 0;
-        for (const auto& [key, value] : reports.asDictionary()) {
-            char expected[64];
-            std::snprintf(expected, sizeof expected, "Failed to get report ID 0x%x: 0xe00002d8", kDebugReportIDs[index]);
-            EXPECT_EQ(key, kDebugReportKeys[index]);
-            EXPECT_EQ(value, PropertyValue::string(expected));
-            ++index;
-        }
+        expectFirmwareReports(reports, "e00002d8");
         EXPECT_FALSE(harness.copyProperty("FactoryResetHoldDuration").hasValue());
-        PropertyValue debug = harness.copyProperty("ServicePluginDebug");
-        EXPECT_EQ(debug.asDictionary().get("FirmwareDebugReports"), reports);
+        EXPECT_EQ(harness.copyProperty("ServicePluginDebug").asDictionary().get("FirmwareDebugReports"), reports);
         harness.tearDown();
     }
-}
-
-TEST(ServiceProperties, PropertyCallsLogTheirKeysAndTheAggregateLooksUpEachKeyOnItsOwn)
-{
-    ServiceHarness harness;
-    harness.bringUp();
-    std::vector<std::string> lines;
-    {
-        CaptureLogSink::Scope capture(LogLevel::Debug);
-        harness.setProperty("Pipeline.Algs.HoldTimeoutMilliseconds", PropertyValue::uint32(420));
-        harness.copyProperty("ServicePluginDebug");
-        // The service refuses what it does not do, through the tables too.
-        HidEventRef event = HidEvent::createVendorDefinedEvent(0, 1, 1, 0, nullptr, 0, 0);
-        EXPECT_EQ(harness.service().setOutputEvent(harness.serviceRef(), event.get()), kVeltoUnsupported);
-        EXPECT_EQ(harness.service().copyEvent(harness.serviceRef(), HidEvent::kTypeDigitizer, event.get(), 0),
-                  nullptr);
-        lines = capture.sink().messages("HIDService");
-    }
-    EXPECT_EQ(lines, (std::vector<std::string>{
-                         "setProperty:420 forKey:Pipeline.Algs.HoldTimeoutMilliseconds",
-                         "getPropertyForKey:ServicePluginDebug",
-                         "getPropertyForKey:Version",
-                         "getPropertyForKey:FirmwareDebugReports",
-                         "getPropertyForKey:Recording",
-                         "getPropertyForKey:Pipeline.DebugInfo",
-                         "getPropertyForKey:Pipeline.Algs.DebugInfo",
-                         "setOutputEvent:",
-                         "copyEventWithType:matching:options:",
-                     }));
-    harness.tearDown();
 }
 
 TEST(ServiceProperties, FactoryResetHoldDurationIsNullUnlessTheReportHasItsIDAndLength)
@@ -276,7 +228,7 @@ TEST(ServiceProperties, FactoryResetHoldDurationIsNullUnlessTheReportHasItsIDAnd
     harness.bringUp();
     for (const Row& row : rows) {
         SCOPED_TRACE(row.what);
-        harness.setDebugReport(0x1F, row.report);
+        harness.device()->setFeatureReport(0x1F, row.report);
         const PropertyValue value = harness.copyProperty("FactoryResetHoldDuration");
         if (row.duration) {
             EXPECT_EQ(value, PropertyValue::uint32(*row.duration));

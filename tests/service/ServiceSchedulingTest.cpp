@@ -5,13 +5,9 @@
 #include "platform/PropertyDictionary.h"
 #include "platform/Semaphore.h"
 #include "platform/SimulatedHostDevice.h"
-#include "platform/Trace.h"
 #include "service/ServiceHarness.h"
 
 #include <gtest/gtest.h>
-
-#include <condition_variable>
-#include <mutex>
 
 using namespace VeltoHost;
 using namespace VeltoTouch::Test;
@@ -19,9 +15,7 @@ using namespace VeltoTouch::Test;
 TEST(ServiceScheduling, RepeatedCyclesDeliverWithTheCallbackOfTheirScheduling)
 {
     ServiceHarness harness;
-    ASSERT_EQ(harness.plugin().Start(harness.pluginRef(), PropertyValue::dictionary({}), ServiceHarness::kServiceHandle),
-              kVeltoSuccess);
-    ASSERT_TRUE(harness.service().open(harness.serviceRef(), 0));
+    harness.start();
 
     // Unscheduling what never ran returns at once.
     harness.unschedule();
@@ -36,8 +30,8 @@ TEST(ServiceScheduling, RepeatedCyclesDeliverWithTheCallbackOfTheirScheduling)
         harness.push(deviceResetReport(static_cast<std::uint64_t>(cycle)));
         ASSERT_TRUE(harness.collector.waitFor(static_cast<std::size_t>(cycle) + 1)) << cycle;
         harness.unschedule();
-        EXPECT_FALSE(harness.deviceIsScheduled()) << cycle;
-        EXPECT_FALSE(harness.deviceHasCallback()) << cycle;
+        EXPECT_FALSE(harness.device()->isScheduled()) << cycle;
+        EXPECT_FALSE(harness.device()->hasCallback()) << cycle;
     }
     harness.queue()->drain();
     std::vector<DeliveredEvent> events = harness.collector.events();
@@ -57,47 +51,31 @@ TEST(ServiceScheduling, RepeatedCyclesDeliverWithTheCallbackOfTheirScheduling)
 
 TEST(ServiceScheduling, DeliveriesQueuedBeforeUnschedulingStillArrive)
 {
-    // Seeing the firmware-event trace point means the report is being
-    // processed: the thread stops only after it has been handled completely.
-    std::mutex lock;
-    std::condition_variable seen;
-    int firmwareEvents = 0;
-    Trace::Observer previous = Trace::setObserver([&](const TracePoint& point) {
-        if (point.code != 0x2B15018C) return;
-        std::lock_guard<std::mutex> guard(lock);
-        ++firmwareEvents;
-        seen.notify_all();
-    });
-
     ServiceHarness harness;
     harness.bringUp();
 
-    // Hold the host's queue so that the batch stays queued.
+    // Hold the host's queue so that the batches stay queued. A report is
+    // handled whole under the lock that the counter's read takes, so once the
+    // count shows both, both batches are queued.
     Semaphore::Ref gate = Semaphore::create(0);
     harness.queue()->async([gate] { gate->wait(); });
     harness.push(deviceResetReport());
     harness.push(deviceResetReport());
-    {
-        std::unique_lock<std::mutex> guard(lock);
-        ASSERT_TRUE(seen.wait_for(guard, std::chrono::seconds(20), [&] { return firmwareEvents == 2; }));
-    }
+    ASSERT_TRUE(harness.waitForResetCount(2));
     harness.unschedule();
-    EXPECT_EQ(harness.collector.count(), 0u);
+    EXPECT_EQ(harness.collector.events().size(), 0u);
     gate->signal();
     ASSERT_TRUE(harness.collector.waitFor(2));
     harness.queue()->drain();
-    EXPECT_EQ(harness.collector.count(), 2u);
+    EXPECT_EQ(harness.collector.events().size(), 2u);
     harness.service().close(harness.serviceRef(), 0);
     harness.plugin().Stop(harness.pluginRef());
-    Trace::setObserver(previous);
 }
 
 TEST(ServiceScheduling, EventsWithoutACallbackAreDropped)
 {
     ServiceHarness harness;
-    ASSERT_EQ(harness.plugin().Start(harness.pluginRef(), PropertyValue::dictionary({}), ServiceHarness::kServiceHandle),
-              kVeltoSuccess);
-    ASSERT_TRUE(harness.service().open(harness.serviceRef(), 0));
+    harness.start();
     harness.schedule();  // no callback was ever set
     harness.push(deviceResetReport());
     ASSERT_TRUE(harness.waitForResetCount(1));
@@ -111,7 +89,7 @@ TEST(ServiceScheduling, EventsWithoutACallbackAreDropped)
     ASSERT_TRUE(harness.collector.waitFor(1));
     harness.unschedule();
     harness.queue()->drain();
-    EXPECT_EQ(harness.collector.count(), 1u);
+    EXPECT_EQ(harness.collector.events().size(), 1u);
     harness.plugin().Stop(harness.pluginRef());
 }
 
