@@ -4,10 +4,7 @@
 
 #include <gtest/gtest.h>
 
-#include <unistd.h>
-
 #include <cstdint>
-#include <cstdio>
 #include <string>
 #include <vector>
 
@@ -32,10 +29,7 @@ TEST(LogFormat, FollowsTheCLibraryConversions)
     EXPECT_EQ(formatLog("%@%*s|", std::string("12"), -2, ""), "12  |");
     EXPECT_EQ(formatLog("100%% %s", "done"), "100% done");
     EXPECT_EQ(formatLog("%d and %d", 1), "1 and (missing)");
-}
-
-TEST(LogFormat, DescribesObjects)
-{
+    // %@ describes an object.
     EXPECT_EQ(formatLog("getPropertyForKey:%@", std::string("Version")), "getPropertyForKey:Version");
     EXPECT_EQ(formatLog("value %@", PropertyValue::uint32(28)), "value 28");
     EXPECT_EQ(formatLog("%@", PropertyValue::array({PropertyValue::int32(28), PropertyValue::int32(0)})), "[28, 0]");
@@ -75,60 +69,6 @@ TEST(Log, BuildsLinesOnlyForEnabledLevels)
     EXPECT_EQ(described, 1);
 }
 
-TEST(Log, ScopeRestoresThresholdAndSink)
-{
-    int before = Log::threshold();
-    {
-        CaptureLogSink::Scope capture(LogLevel::Debug);
-        EXPECT_EQ(Log::threshold(), static_cast<int>(LogLevel::Debug));
-        Log("HIDService").debug("inside");
-        EXPECT_EQ(capture.sink().messages().size(), 1u);
-    }
-    EXPECT_EQ(Log::threshold(), before);
-}
-
-namespace {
-
-// Points standard error at a temporary file for the life of the object and
-// hands back what was written to it.
-class StandardErrorCapture {
-public:
-    StandardErrorCapture() : _file(std::tmpfile())
-    {
-        std::fflush(stderr);
-        _saved = dup(STDERR_FILENO);
-        dup2(fileno(_file), STDERR_FILENO);
-    }
-    ~StandardErrorCapture()
-    {
-        restore();
-        std::fclose(_file);
-    }
-    std::string text()
-    {
-        restore();
-        std::string text;
-        std::rewind(_file);
-        for (int c = std::fgetc(_file); c != EOF; c = std::fgetc(_file)) text += static_cast<char>(c);
-        return text;
-    }
-
-private:
-    void restore()
-    {
-        if (_saved < 0) return;
-        std::fflush(stderr);
-        dup2(_saved, STDERR_FILENO);
-        close(_saved);
-        _saved = -1;
-    }
-
-    std::FILE* _file;
-    int _saved = -1;
-};
-
-}  // namespace
-
 TEST(Log, TheStandardErrorSinkWritesOneLinePerMessage)
 {
     // Messages whose text ends in line breaks of their own (the disjoint
@@ -137,16 +77,15 @@ TEST(Log, TheStandardErrorSinkWritesOneLinePerMessage)
     const int threshold = Log::threshold();
     Log::setThreshold(LogLevel::Debug);
     auto previous = Log::setSink(nullptr);
-    std::string written;
+    testing::internal::CaptureStderr();
     {
-        StandardErrorCapture capture;
         Log log("HIDService", "org.example.hid.VeltoTouch");
         log.error("Disjoint image (frame number: %ju -> %ju)\n\n", 7u, 9u);
         log.log("Received image frame: %ju", 9u);
         log.debug("%s", "\n");
         log.debug("dump\nsecond row\n");
-        written = capture.text();
     }
+    const std::string written = testing::internal::GetCapturedStderr();
     Log::setSink(previous);
     Log::setThreshold(threshold);
     EXPECT_EQ(written,
