@@ -71,23 +71,13 @@ TEST(DaemonTest, ServesSimulatedAndHotPluggedDevicesAndTakesOnlyTheConfiguredOne
     ASSERT_TRUE(client.connected()) << client.connectError();
     ASSERT_TRUE(client.watchSignals());
 
-    std::atomic<bool> stop{false};
     {
         Daemon daemon(options, std::move(watcher), [&](const DeviceWatcher::Device&) {
             ++opened;
             return SimulatedHostDevice::create();
         });
-        std::thread serving([&] { daemon.run([&] { return stop.load(); }); });
-        // Ends the serving thread before the daemon goes, also when an assertion returns early.
-        struct Joiner {
-            std::atomic<bool>& stop;
-            std::thread& thread;
-            ~Joiner()
-            {
-                stop = true;
-                if (thread.joinable()) thread.join();
-            }
-        } joiner{stop, serving};
+        // Stopped and joined before the daemon goes, also when an assertion returns early.
+        std::jthread serving([&](std::stop_token stop) { daemon.run([&] { return stop.stop_requested(); }); });
         while (!plugs.started()) std::this_thread::sleep_for(1ms);
 
         // Both recordings play as devices 0 and 1 and stay attached.
@@ -105,9 +95,23 @@ TEST(DaemonTest, ServesSimulatedAndHotPluggedDevicesAndTakesOnlyTheConfiguredOne
 
         plugs.unplug("/dev/hidraw-test");
         ASSERT_TRUE(client.waitUntil([&] { return client.signalsNamed("DeviceRemoved").size() == 1; }));
-        EXPECT_EQ(client.listDevices().size(), 2u);
+        EXPECT_EQ(client.name(BusService::devicePath(2)).error, "org.freedesktop.DBus.Error.UnknownObject");
+        // Plugged again, it gets a new number: a path once removed never means another device.
+        plugs.plug({"/dev/hidraw-test", 3, 0x1234, 0x5678});
+        ASSERT_TRUE(client.waitUntil([&] { return client.signalsNamed("DeviceAdded").size() == 4; }));
+        EXPECT_EQ(client.listDevices(),
+                  (std::vector<std::string>{BusService::devicePath(0), BusService::devicePath(1), BusService::devicePath(3)}));
     }
-    EXPECT_EQ(opened.load(), 1);
+    EXPECT_EQ(opened.load(), 2);
     // The daemon is gone: its devices went with it, in order.
-    ASSERT_TRUE(client.waitUntil([&] { return client.signalsNamed("DeviceRemoved").size() == 3; }));
+    ASSERT_TRUE(client.waitUntil([&] { return client.signalsNamed("DeviceRemoved").size() == 4; }));
+    std::vector<std::string> announced;
+    for (const auto& signal : client.signals()) {
+        if (signal.member != "DeviceAdded" && signal.member != "DeviceRemoved") continue;
+        EXPECT_EQ(signal.path, BusService::kManagerPath);
+        announced.push_back(signal.member + " " + signal.object.substr(signal.object.rfind('/') + 1));
+    }
+    EXPECT_EQ(announced, (std::vector<std::string>{"DeviceAdded 0", "DeviceAdded 1", "DeviceAdded 2", "DeviceRemoved 2",
+                                                   "DeviceAdded 3", "DeviceRemoved 0", "DeviceRemoved 1",
+                                                   "DeviceRemoved 3"}));
 }

@@ -45,14 +45,13 @@ PipelineRecording recordingOf(const std::string& name) { return PipelineRecordin
 
 }  // namespace
 
-TEST(DeviceSessionTest, GesturesBecomeSignalsAndKeysAndAHeldKeyIsReleasedWhenTheDeviceGoes)
+// That the session's gestures become signals, in replay's order, is checked
+// end to end on the daemon's bus; here the keys they become.
+TEST(DeviceSessionTest, GesturesBecomeKeysAndAHeldKeyIsReleasedWhenTheDeviceGoes)
 {
     PrivateBus bus;
     ASSERT_FALSE(bus.address().empty()) << bus.error();
     BusService service(BusConnection::Address::at(bus.address()));
-    ControlClient client(BusConnection::Address::at(bus.address()));
-    ASSERT_TRUE(client.connected()) << client.connectError();
-    ASSERT_TRUE(client.watchSignals());
     RecordingKeyboard keyboard;
     std::mutex keyboardLock;
     const DeviceSession::Outputs outputs{&service, &keyboard, &keyboardLock, KeyMap::defaultBindings()};
@@ -63,14 +62,10 @@ TEST(DeviceSessionTest, GesturesBecomeSignalsAndKeysAndAHeldKeyIsReleasedWhenThe
         ASSERT_EQ(session.busId(), std::optional<BusService::DeviceId>(0));
         session.playInBackground(recordingOf("taps.json"), device, 0);
         ASSERT_TRUE(session.waitUntilPlayed(20s));
-        ASSERT_TRUE(client.waitUntil([&] { return client.signalsNamed("Gesture").size() == 6; }));
-        // Still attached and readable after its recording ended.
-        EXPECT_EQ(client.getProperty(BusService::devicePath(0), "Pipeline.DebugInfo").error, "");
     }
     // Taps at the top, in the middle and at the bottom.
     EXPECT_EQ(keyboard.actions(), (std::vector<std::string>{"+KEY_VOLUMEUP", "-KEY_VOLUMEUP", "+KEY_PLAYPAUSE",
                                                             "-KEY_PLAYPAUSE", "+KEY_VOLUMEDOWN", "-KEY_VOLUMEDOWN"}));
-    ASSERT_TRUE(client.waitUntil([&] { return client.signalsNamed("DeviceRemoved").size() == 1; }));
 
     // A hold in the middle cut short by the device going away: the voice
     // command key is not left down.
