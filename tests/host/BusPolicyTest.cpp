@@ -16,6 +16,7 @@
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
+#include <iterator>
 #include <string>
 #include <vector>
 
@@ -25,30 +26,12 @@ namespace {
 
 constexpr const char* kAccessDenied = "org.freedesktop.DBus.Error.AccessDenied";
 
-// What the unprivileged client found, one bit per expectation that held.
-enum Finding : int {
-    kMayList = 1 << 0,
-    kMayGet = 1 << 1,
-    kMayReadName = 1 << 2,
-    kSetDenied = 1 << 3,
-    kSaveDenied = 1 << 4,
-    kOwnDenied = 1 << 5,
-    kReceivesSignals = 1 << 6,
-};
-
-struct Expectation {
-    Finding finding;
-    const char* what;
-};
-
-const Expectation kExpectations[] = {
-    {kMayList, "may call ListDevices"},
-    {kMayGet, "may call GetProperty"},
-    {kMayReadName, "may read the Name property"},
-    {kSetDenied, "is refused SetProperty"},
-    {kSaveDenied, "is refused SaveRecording"},
-    {kOwnDenied, "may not own the service's name"},
-    {kReceivesSignals, "receives the device's signals"},
+// What an unprivileged client is expected to find, one bit each in the
+// child's exit code, in this order.
+const char* const kExpectations[] = {
+    "may call ListDevices",          "may call GetProperty",           "may read the Name property",
+    "is refused SetProperty",        "is refused SaveRecording",       "may not own the service's name",
+    "receives the device's signals",
 };
 
 // What the bus answers a client that asks for the service's well-known name.
@@ -65,6 +48,18 @@ int ownServiceName(const std::string& address)
     return result;
 }
 
+// Tells the parent that the signal match is in place, then waits for the
+// device-reset signal it publishes.
+bool receivesSignals(ControlClient& client, int readyFd, int goFd)
+{
+    if (!client.watchSignals()) return false;
+    client.listDevices();  // a round trip: the match is in place at the bus from here on
+    const char ready = 'r';
+    char go = 0;
+    return ::write(readyFd, &ready, 1) == 1 && ::read(goFd, &go, 1) == 1 &&
+           client.waitUntil([&] { return !client.signalsNamed("DeviceReset").empty(); });
+}
+
 // Runs in the forked child, as `uid`/`gid`: no test macros, only the exit code.
 int probeAsUnprivileged(const std::string& address, const std::string& device, const std::string& file, uid_t uid,
                         gid_t gid, int readyFd, int goFd)
@@ -75,30 +70,22 @@ int probeAsUnprivileged(const std::string& address, const std::string& device, c
         std::fprintf(stderr, "unprivileged client: %s\n", client.connectError().c_str());
         return 0x80;
     }
-    int found = 0;
     ControlClient::Reply listed;
-    if (client.listDevices(&listed) == std::vector<std::string>{device} && listed.ok()) found |= kMayList;
-    const ControlClient::Reply got = client.getProperty(device, "Pipeline.Algs.HoldTimeoutMilliseconds");
-    if (got.error.empty() && !got.value.empty()) found |= kMayGet;
-    if (client.name(device).value == "sim:policy.json") found |= kMayReadName;
-    if (client.setProperty(device, "Pipeline.Algs.HoldTimeoutMilliseconds", "1").error == kAccessDenied) {
-        found |= kSetDenied;
-    }
-    if (client.saveRecording(device, file).error == kAccessDenied) found |= kSaveDenied;
-    if (ownServiceName(address) == -EACCES) found |= kOwnDenied;
-
-    if (client.watchSignals()) {
-        client.listDevices();  // a round trip: the match is in place at the bus from here on
-        const char ready = 'r';
-        if (::write(readyFd, &ready, 1) == 1) {
-            char go = 0;
-            if (::read(goFd, &go, 1) == 1 &&
-                client.waitUntil([&] { return !client.signalsNamed("DeviceReset").empty(); })) {
-                found |= kReceivesSignals;
-            }
-        }
-    }
-    return found;
+    const bool found[] = {
+        client.listDevices(&listed) == std::vector<std::string>{device} && listed.ok(),
+        [&] {
+            const ControlClient::Reply got = client.getProperty(device, "Pipeline.Algs.HoldTimeoutMilliseconds");
+            return got.error.empty() && !got.value.empty();
+        }(),
+        client.name(device).value == "sim:policy.json",
+        client.setProperty(device, "Pipeline.Algs.HoldTimeoutMilliseconds", "1").error == kAccessDenied,
+        client.saveRecording(device, file).error == kAccessDenied,
+        ownServiceName(address) == -EACCES,
+        receivesSignals(client, readyFd, goFd),
+    };
+    int bits = 0;
+    for (std::size_t i = 0; i < std::size(found); ++i) bits |= found[i] ? 1 << i : 0;
+    return bits;
 }
 
 }  // namespace
@@ -153,8 +140,8 @@ TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwn)
     ASSERT_TRUE(WIFEXITED(status));
     const int found = WEXITSTATUS(status);
     ASSERT_NE(found, 0x80) << "the child could not become uid " << uid << " or reach the bus";
-    for (const Expectation& expectation : kExpectations) {
-        EXPECT_TRUE(found & expectation.finding) << "an unprivileged user " << expectation.what;
+    for (std::size_t i = 0; i < std::size(kExpectations); ++i) {
+        EXPECT_TRUE(found & (1 << i)) << "an unprivileged user " << kExpectations[i];
     }
     // The refused write did not land.
     PropertyValue timeout;

@@ -21,14 +21,11 @@ namespace {
 // Starting the daemon takes milliseconds; this only bounds a broken start.
 constexpr int kStartTimeoutMs = 10'000;
 
-}  // namespace
-
-std::string PrivateBus::openPolicy()
+// A default policy: `ownAndCall` says who may own names and call methods;
+// replies, signals and receiving are open on every bus of these tests.
+std::string defaultPolicy(const std::string& ownAndCall)
 {
-    return R"(<policy context="default">
-    <allow user="*"/>
-    <allow own="*"/>
-    <allow send_type="method_call"/>
+    return "<policy context=\"default\">\n    <allow user=\"*\"/>\n" + ownAndCall + R"(
     <allow send_type="signal"/>
     <allow send_requested_reply="true" send_type="method_return"/>
     <allow send_requested_reply="true" send_type="error"/>
@@ -39,25 +36,23 @@ std::string PrivateBus::openPolicy()
   </policy>)";
 }
 
+}  // namespace
+
+std::string PrivateBus::openPolicy()
+{
+    return defaultPolicy(R"(    <allow own="*"/>
+    <allow send_type="method_call"/>)");
+}
+
 std::string PrivateBus::systemPolicy()
 {
-    return R"(<policy context="default">
-    <allow user="*"/>
-    <deny own="*"/>
+    return defaultPolicy(R"(    <deny own="*"/>
     <deny send_type="method_call"/>
-    <allow send_type="signal"/>
-    <allow send_requested_reply="true" send_type="method_return"/>
-    <allow send_requested_reply="true" send_type="error"/>
-    <allow receive_type="method_call"/>
-    <allow receive_type="method_return"/>
-    <allow receive_type="error"/>
-    <allow receive_type="signal"/>
     <allow send_destination="org.freedesktop.DBus" send_interface="org.freedesktop.DBus"/>
     <allow send_destination="org.freedesktop.DBus" send_interface="org.freedesktop.DBus.Introspectable"/>
     <allow send_destination="org.freedesktop.DBus" send_interface="org.freedesktop.DBus.Properties"/>
     <deny send_destination="org.freedesktop.DBus" send_interface="org.freedesktop.DBus"
-          send_member="UpdateActivationEnvironment"/>
-  </policy>)";
+          send_member="UpdateActivationEnvironment"/>)");
 }
 
 PrivateBus::PrivateBus(const std::string& policy, const std::string& type, const std::string& include)
