@@ -1,16 +1,12 @@
 #include "RecordingTestSupport.h"
 
-#include "pipeline/Pipeline.h"
 #include "pipeline/Util.h"
 #include "platform/MonotonicClock.h"
-#include "platform/PropertyDictionary.h"
 
 #include <gtest/gtest.h>
 
-#include <array>
 #include <limits>
 #include <memory>
-#include <optional>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -170,96 +166,6 @@ TEST(Playback, WithoutAWrappedInputFramesAreConsumedAndWaitedFor)
     expectFinished(f.recording);
     EXPECT_EQ(f.sleeps, (std::vector<std::uint64_t>{3000}));
     EXPECT_TRUE(f.log->calls.empty());
-}
-
-// Collects what a pipeline emits, with times relative to the first time it
-// was given, so that a live run and a replay started later can be compared.
-// An event's description with its absolute time stamp masked, since replays
-// run at another time than the recording.
-std::string withoutTimestamp(std::string description)
-{
-    const std::string label = "timestamp=";
-    const auto start = description.find(label);
-    if (start == std::string::npos) return description;
-    const auto digits = start + label.size();
-    const auto end = description.find_first_not_of("0123456789", digits);
-    description.replace(digits, (end == std::string::npos ? description.size() : end) - digits, "T");
-    return description;
-}
-
-struct EventCollector {
-    explicit EventCollector(VeltoTouch::Pipeline& pipeline)
-    {
-        pipeline.setTimeProbe = [this](std::uint64_t time) {
-            if (!origin) origin = time;
-        };
-        pipeline.hidEventsProbe = [this](const VeltoHost::HidEventList& list) {
-            for (const auto& event : list) {
-                events.push_back(withoutTimestamp(event->description()));
-                times.push_back(event->timeStamp() - origin.value_or(0));
-            }
-        };
-    }
-
-    std::optional<std::uint64_t> origin;
-    std::vector<std::string> events;
-    // In ticks from the first time given.
-    std::vector<std::uint64_t> times;
-};
-
-// A replayed time goes from ticks to the recording's nanoseconds and back,
-// and each direction truncates: unless a tick is a whole number of
-// nanoseconds, the replay may see a time one tick short of the live one.
-std::uint64_t roundTripShortfall()
-{
-    const VeltoHost::Timebase tick = MonotonicClock::timebase();
-    return tick.numer % tick.denom == 0 ? 0 : 1;
-}
-
-TEST(Playback, ReplayIntoAFreshPipelineGivesTheEventsOfTheLiveRun)
-{
-    auto live = std::make_shared<VeltoTouch::Pipeline>();
-    EventCollector liveEvents(*live);
-    PipelineRecording recorder;
-    recorder.pipeline = live;
-    auto feed = [&recorder](const std::vector<std::uint8_t>& report) {
-        recorder.handleInputReport(report.data(), report.size());
-    };
-
-    recorder.setState("Algs.HoldTimeoutMilliseconds", PropertyValue::uint64(400));
-    std::array<std::int16_t, 15> touch{};
-    touch.fill(900);
-    std::uint32_t frameNumber = 100;
-    for (int round = 0; round < 3; ++round) {
-        for (int i = 0; i < 20; ++i) {
-            ++frameNumber;
-            const bool touched = i >= 5 && i < 12;
-            feed(imageReport(frameNumber, frameNumber * 8, touched ? touch : std::array<std::int16_t, 15>{}));
-        }
-        feed(firmwareEventReport(0));  // device reset
-        feed(firmwareEventReport(1));  // another firmware notice: ignored
-        frameNumber += 3;              // a frame-number gap
-    }
-    feed({0x7F, 0x00});  // neither a firmware event nor an image
-    ASSERT_GE(liveEvents.events.size(), 3u) << "at least the three reset events";
-
-    PipelineRecording replay{std::string_view(recorder.json())};
-    auto fresh = std::make_shared<VeltoTouch::Pipeline>();
-    EventCollector replayEvents(*fresh);
-    replay.pipeline = fresh;
-    replay.sleepMicroseconds = [](std::uint64_t) {};
-    replay.playReset();
-    while (replay.playCanContinue()) replay.playNextFrame(1.0f);
-
-    EXPECT_EQ(replayEvents.events, liveEvents.events);
-    ASSERT_EQ(replayEvents.times.size(), liveEvents.times.size());
-    for (std::size_t i = 0; i < liveEvents.times.size(); ++i) {
-        EXPECT_LE(replayEvents.times[i], liveEvents.times[i]) << i;
-        EXPECT_LE(liveEvents.times[i] - replayEvents.times[i], roundTripShortfall()) << i;
-    }
-    EXPECT_EQ(fresh->getState("DebugInfo"), live->getState("DebugInfo"));
-    EXPECT_EQ(fresh->getState("DebugInfo").asDictionary().get("DisjointImageCount"), PropertyValue::uint32(2));
-    EXPECT_EQ(fresh->getState("Algs.HoldTimeoutMilliseconds"), live->getState("Algs.HoldTimeoutMilliseconds"));
 }
 
 }  // namespace

@@ -21,11 +21,6 @@ std::uint64_t monotonicNanoseconds()
 
 TEST(ClockTimebase, TheClockAndTheConversionsAgreeOnTheTick)
 {
-    EXPECT_EQ(MonotonicClock::timebase().numer, 125u);
-    EXPECT_EQ(MonotonicClock::timebase().denom, 3u);
-    EXPECT_EQ(VeltoTouch::Util::nanosecondsFromMachTime(3), 125u);
-    EXPECT_EQ(VeltoTouch::Util::machTimeFromNanoseconds(1000), 24u);
-
     // A reading of the clock, converted to nanoseconds, lies between two
     // nanosecond readings taken around it (less one tick of truncation).
     const std::uint64_t before = monotonicNanoseconds();
