@@ -5,44 +5,22 @@
 #include "recording/JsonValue.h"
 
 #include <gtest/gtest.h>
-#include <nlohmann/json.hpp>
 
-#include <atomic>
-#include <chrono>
-#include <cmath>
-#include <thread>
-#include <cstdio>
 #include <unistd.h>
+
+#include <cstdio>
 #include <limits>
+#include <memory>
 #include <optional>
 #include <stdexcept>
 #include <string>
+#include <utility>
 
 namespace {
 
 using namespace RecordingTestSupport;
 using VeltoHost::PropertyDictionary;
 using VeltoTouch::JsonValue;
-
-// Frames of a container text as ContainerStream hands them over, from a
-// file in memory (seekable, like a file on disk).
-PipelineRecording::FrameList streamFrames(const std::string& text, std::size_t* handedBeforeFault = nullptr)
-{
-    std::FILE* file = std::tmpfile();
-    std::fwrite(text.data(), 1, text.size(), file);
-    std::fflush(file);
-    ::lseek(::fileno(file), 0, SEEK_SET);
-    PipelineRecording::FrameList frames;
-    try {
-        VeltoTouch::ContainerStream::read(::fileno(file), [&](Frame&& frame) { frames.push_back(std::move(frame)); });
-    } catch (...) {
-        std::fclose(file);
-        if (handedBeforeFault) *handedBeforeFault = frames.size();
-        throw;
-    }
-    std::fclose(file);
-    return frames;
-}
 
 void expectSameFrames(const PipelineRecording::FrameList& actual, const PipelineRecording::FrameList& expected)
 {
@@ -58,62 +36,6 @@ void expectSameFrames(const PipelineRecording::FrameList& actual, const Pipeline
         EXPECT_EQ(a->report, e.report);
         ++a;
     }
-}
-
-TEST(RecordingContainer, EmptyRecordingWritesVersionOneWithNoFramesAndReadsBack)
-{
-    PipelineRecording recording;
-    const std::string text = recording.json();
-    const auto document = nlohmann::json::parse(text);
-    EXPECT_EQ(document.at("Version"), 1);
-    EXPECT_TRUE(document.at("Frames").is_array());
-    EXPECT_TRUE(document.at("Frames").empty());
-
-    PipelineRecording readBack{std::string_view(text)};
-    EXPECT_TRUE(readBack.frames().empty());
-    EXPECT_EQ(readBack.maxFrameCount(), 0u);
-    EXPECT_EQ(readBack.pipeline, nullptr);
-    EXPECT_FALSE(readBack.playCanContinue());
-}
-
-TEST(RecordingContainer, FramesRoundTripWithValuesNoValueNullAndReportsOfEveryLength)
-{
-    PropertyDictionary nested;
-    nested.set("z", PropertyValue::string("last"));
-    nested.set("a", PropertyValue::array({PropertyValue::boolean(false), PropertyValue::null()}));
-
-    PipelineRecording recording;
-    recording.appendFrame(stateFrame(5, "Algs.HoldTimeoutMilliseconds", PropertyValue::uint64(250)));
-    recording.appendFrame(stateFrame(6, "Algs.NoValue", PropertyValue()));
-    recording.appendFrame(stateFrame(7, "Algs.Null", PropertyValue::null()));
-    recording.appendFrame(stateFrame(8, "negative", PropertyValue::int64(-42)));
-    recording.appendFrame(stateFrame(9, "fraction", PropertyValue::float64(0.125)));
-    recording.appendFrame(stateFrame(10, "text \"quoted\" \xc3\xa9", PropertyValue::string("line\nbreak")));
-    recording.appendFrame(stateFrame(11, "", PropertyValue::dictionary(nested)));
-    recording.appendFrame(stateFrame(12, "flag", PropertyValue::boolean(true)));
-    for (std::size_t length : {0u, 1u, 2u, 9u, 10u, 72u, 73u, 200u}) {
-        std::vector<std::uint8_t> bytes(length);
-        for (std::size_t i = 0; i < length; ++i) bytes[i] = static_cast<std::uint8_t>(i * 37 + length);
-        recording.appendFrame(reportFrame(1000 + length, bytes));
-    }
-    // Backwards and extreme time stamps are kept as they stand.
-    recording.appendFrame(reportFrame(std::numeric_limits<std::uint64_t>::max(), {0x01, 0xA0, 0xFF}));
-    recording.appendFrame(reportFrame(0, {0x02}));
-
-    const std::string text = recording.json();
-    EXPECT_NE(text.find("\n  "), std::string::npos) << "written indented";
-    EXPECT_NE(text.find("\"01 a0 ff \""), std::string::npos);
-    EXPECT_NE(text.find("18446744073709551615"), std::string::npos) << "time stamps are written as exact integers";
-
-    const auto document = nlohmann::json::parse(text);
-    EXPECT_FALSE(document["Frames"][1].contains("Value")) << "a frame without value has no \"Value\"";
-    EXPECT_TRUE(document["Frames"][2].at("Value").is_null());
-    EXPECT_EQ(document["Frames"][8].at("Report"), "") << "an empty report is the empty text";
-
-    PipelineRecording readBack{std::string_view(text)};
-    expectSameFrames(readBack.frames(), recording.frames());
-    EXPECT_EQ(readBack.json(), text) << "writing the read recording gives the same container";
-    expectSameFrames(streamFrames(text), recording.frames());
 }
 
 TEST(RecordingContainer, AStreamedContainerHandsOverWhatTheWholeTextReaderReads)
@@ -139,12 +61,9 @@ TEST(RecordingContainer, AStreamedContainerHandsOverWhatTheWholeTextReaderReads)
         expectSameFrames(streamFrames(text), whole.frames());
     }
 
-    // A fault is raised where it is reached, after the frames before it.
+    // A fault is raised where it is reached, after the frames before it (a
+    // faulty frame after good ones is checked through `replay` and `host`).
     std::size_t handed = 0;
-    EXPECT_THROW(streamFrames(R"({"Version": 1, "Frames": [{)" + report + "}, {" + report + R"(}, {"Type": 1}]})",
-                              &handed),
-                 std::invalid_argument);
-    EXPECT_EQ(handed, 2u);
     EXPECT_THROW(streamFrames(R"({"Version": 1, "Frames": [{)" + report + "}, ", &handed), std::runtime_error);
     EXPECT_EQ(handed, 1u);
 
@@ -162,49 +81,17 @@ TEST(RecordingContainer, AStreamedContainerHandsOverWhatTheWholeTextReaderReads)
     }
     ::close(ends[0]);
 
-    // A stop ends a read that waits for input that never comes, whenever it
-    // comes: before the read, or while it waits.
-    for (const bool stopFirst : {true, false}) {
-        ASSERT_EQ(::pipe(ends), 0);
-        const std::string start = R"({"Version": 1, "Frames": [{)" + report + "}, ";
-        ASSERT_EQ(::write(ends[1], start.data(), start.size()), static_cast<ssize_t>(start.size()));
-        std::atomic<bool> stop{stopFirst};
-        std::thread stopper([&] {
-            std::this_thread::sleep_for(std::chrono::milliseconds(50));
-            stop = true;
-        });
-        handed = 0;
-        EXPECT_THROW(VeltoTouch::ContainerStream::read(
-                         ends[0], [&](Frame&&) { ++handed; }, [&] { return stop.load(); }),
-                     std::runtime_error);
-        stopper.join();
-        EXPECT_EQ(handed, stopFirst ? 0u : 1u);
-        ::close(ends[0]);
-        ::close(ends[1]);
-    }
-}
-
-TEST(RecordingContainer, ValuesJsonCannotHoldAreWrittenWithoutFailing)
-{
-    PipelineRecording recording;
-    recording.appendFrame(stateFrame(1, "bytes", PropertyValue::bytes({0x00, 0x0A, 0xFF})));
-    recording.appendFrame(stateFrame(2, "nan", PropertyValue::float64(std::nan(""))));
-    recording.appendFrame(stateFrame(3, "inf", PropertyValue::float32(-std::numeric_limits<float>::infinity())));
-    recording.appendFrame(stateFrame(4, "float", PropertyValue::float32(0.1f)));
-    recording.appendFrame(stateFrame(5, "bad\xff utf8", PropertyValue::string("\xc3")));
-
-    std::string text;
-    ASSERT_NO_THROW(text = recording.json());
-    PipelineRecording readBack{std::string_view(text)};
-    std::vector<PropertyValue> values;
-    for (const Frame& frame : readBack.frames()) values.push_back(frame.value);
-    ASSERT_EQ(values.size(), 5u);
-    EXPECT_EQ(values[0], PropertyValue::string("00 0a ff "));
-    EXPECT_EQ(values[1], PropertyValue::null());
-    EXPECT_EQ(values[2], PropertyValue::null());
-    EXPECT_EQ(values[3], PropertyValue::float64(0.1)) << "float32 written in its shortest form";
-    EXPECT_EQ(std::next(readBack.frames().begin(), 4)->key, "bad\xef\xbf\xbd utf8");
-    EXPECT_EQ(values[4], PropertyValue::string("\xef\xbf\xbd"));
+    // A stop requested before the read ends it, although its input never
+    // ends; a stop while it waits is checked through `host` on a FIFO.
+    ASSERT_EQ(::pipe(ends), 0);
+    const std::string start = R"({"Version": 1, "Frames": [{)" + report + "}, ";
+    ASSERT_EQ(::write(ends[1], start.data(), start.size()), static_cast<ssize_t>(start.size()));
+    handed = 0;
+    EXPECT_THROW(VeltoTouch::ContainerStream::read(ends[0], [&](Frame&&) { ++handed; }, [] { return true; }),
+                 std::runtime_error);
+    EXPECT_EQ(handed, 0u);
+    ::close(ends[0]);
+    ::close(ends[1]);
 }
 
 TEST(RecordingContainer, VersionZeroMigratesReportsAndBooleansCountAsNumbers)
@@ -230,20 +117,6 @@ TEST(RecordingContainer, VersionZeroMigratesReportsAndBooleansCountAsNumbers)
     EXPECT_TRUE(falseVersion.frames().empty());
 }
 
-TEST(RecordingContainer, ReportTextIsReadInEveryHexForm)
-{
-    PipelineRecording recording{std::string_view(R"({"Version": 1, "Frames": [
-        {"Type": "InputReport", "Timestamp": 1, "Report": "01 A0 Ff "},
-        {"Type": "InputReport", "Timestamp": 2, "Report": "01 a0 ff"},
-        {"Type": "InputReport", "Timestamp": 3, "Report": "0x01   0XA0\nff"},
-        {"Type": "InputReport", "Timestamp": 4, "Report": "01 a0 ff ,02"},
-        {"Type": "InputReport", "Timestamp": 5, "Report": "   "}]})")};
-    std::vector<std::vector<std::uint8_t>> reports;
-    for (const Frame& frame : recording.frames()) reports.push_back(frame.report);
-    const std::vector<std::uint8_t> bytes{0x01, 0xA0, 0xFF};
-    EXPECT_EQ(reports, (std::vector<std::vector<std::uint8_t>>{bytes, bytes, bytes, bytes, {}}));
-}
-
 TEST(RecordingContainer, MigrationReturnsCurrentContainersAsTheSameValue)
 {
     const PropertyValue current = JsonValue::parse(R"({"Version": 1, "Frames": [], "Other": 3})");
@@ -265,6 +138,9 @@ struct ReadError {
     std::string message;
 };
 
+// Faults that `replay` and `dump` name through the real binary (malformed
+// text, no object at the top, version 2, no frames, bad hex) are checked
+// there, with the prefix that tells the families apart.
 TEST(RecordingContainer, EveryFaultRaisesItsMessageInItsFamily)
 {
     const std::string prefix = "migrateSerializedContainer failed: ";
@@ -273,12 +149,8 @@ TEST(RecordingContainer, EveryFaultRaisesItsMessageInItsFamily)
     const ReadError cases[] = {
         {"no data", std::nullopt, Family::InvalidArgument, "json not supplied"},
         {"empty text", "", Family::Runtime, prefix + "invalid container"},
-        {"malformed", R"({"Version": 1,)", Family::Runtime, prefix + "invalid container"},
         {"trailing text", R"({"Version": 1, "Frames": []} x)", Family::Runtime, prefix + "invalid container"},
         {"comment", "// note\n{\"Version\": 1, \"Frames\": []}", Family::Runtime, prefix + "invalid container"},
-        {"scalar", "42", Family::Runtime, prefix + "invalid container"},
-        {"string", R"("text")", Family::Runtime, prefix + "invalid container"},
-        {"array", R"([{"Version": 1}])", Family::Runtime, prefix + "invalid container"},
         {"invalid utf-8", "{\"Version\": 1, \"Frames\": [], \"\xff\": 0}", Family::Runtime,
          prefix + "invalid container"},
         {"too deep", deep, Family::Runtime, prefix + "invalid container"},
@@ -292,8 +164,6 @@ TEST(RecordingContainer, EveryFaultRaisesItsMessageInItsFamily)
          Family::Runtime, prefix + "invalid container"},
         {"no version", R"({"Frames": []})", Family::Runtime, prefix + "invalid version"},
         {"text version", R"({"Version": "1"})", Family::Runtime, prefix + "invalid version"},
-        {"null version", R"({"Version": null})", Family::Runtime, prefix + "invalid version"},
-        {"version 2", R"({"Version": 2})", Family::Runtime, prefix + "invalid container version: 2"},
         {"version -1", R"({"Version": -1})", Family::Runtime,
          prefix + "invalid container version: 18446744073709551615"},
         {"v0 no timestamp", R"({"Version": 0, "Reports": [{"ReportData": "01 "}]})", Family::Runtime,
@@ -307,7 +177,6 @@ TEST(RecordingContainer, EveryFaultRaisesItsMessageInItsFamily)
          Family::InvalidArgument, "invalid frame timestamp"},
         {"v0 data kind", R"({"Version": 0, "Reports": [{"Timestamp": 1, "ReportData": null}]})",
          Family::InvalidArgument, "invalid report"},
-        {"no frames", R"({"Version": 1})", Family::InvalidArgument, "invalid frames"},
         {"frames object", R"({"Version": 1, "Frames": {}})", Family::InvalidArgument, "invalid frames"},
         {"frame not object", v1 + "[]]}", Family::InvalidArgument, "frame is not an object"},
         {"empty frame", v1 + "{}]}", Family::InvalidArgument, "invalid frame type"},
@@ -325,8 +194,6 @@ TEST(RecordingContainer, EveryFaultRaisesItsMessageInItsFamily)
          "invalid report"},
         {"report number", v1 + R"({"Type": "InputReport", "Timestamp": 1, "Report": 1}]})",
          Family::InvalidArgument, "invalid report"},
-        {"report not hex", v1 + R"({"Type": "InputReport", "Timestamp": 1, "Report": "01 100 "}]})",
-         Family::InvalidArgument, "invalid hex string"},
         {"second frame faulty", v1 + R"({"Type": "State", "Timestamp": 1, "Key": "k"}, {"Type": "State"}]})",
          Family::InvalidArgument, "invalid frame timestamp"},
     };
@@ -359,40 +226,18 @@ TEST(RecordingContainer, EveryFaultRaisesItsMessageInItsFamily)
 
 TEST(RecordingContainer, MigrationAloneRaisesUnprefixedInvalidArgument)
 {
-    EXPECT_THROW(
-        {
-            try {
-                PipelineRecording::migrateSerializedContainer(PropertyValue());
-            } catch (const std::invalid_argument& error) {
-                EXPECT_STREQ(error.what(), "invalid container");
-                throw;
-            }
-        },
-        std::invalid_argument);
-    try {
-        PipelineRecording::migrateSerializedContainer(JsonValue::parse(R"({"Version": 7})"));
-        ADD_FAILURE() << "no error raised";
-    } catch (const std::invalid_argument& error) {
-        EXPECT_STREQ(error.what(), "invalid container version: 7");
+    const std::pair<PropertyValue, const char*> cases[] = {
+        {PropertyValue(), "invalid container"},
+        {JsonValue::parse(R"({"Version": 7})"), "invalid container version: 7"},
+    };
+    for (const auto& [container, message] : cases) {
+        try {
+            PipelineRecording::migrateSerializedContainer(container);
+            ADD_FAILURE() << "no error raised";
+        } catch (const std::invalid_argument& error) {
+            EXPECT_STREQ(error.what(), message);
+        }
     }
-}
-
-TEST(RecordingContainer, WritingTrimsTheRecordingToItsLimit)
-{
-    PipelineRecording recording;
-    recording.setMaxFrameCount(4);
-    recording.appendFrame(stateFrame(1, "a", PropertyValue::uint64(1)));
-    for (std::uint8_t i = 1; i <= 5; ++i) recording.appendFrame(reportFrame(10 * i, {i}));
-    recording.appendFrame(stateFrame(60, "a", PropertyValue::uint64(2)));
-    ASSERT_EQ(recording.frames().size(), 7u) << "seven frames stay below twice the limit";
-
-    PipelineRecording written{std::string_view(recording.json())};
-    const PipelineRecording::FrameList expected{stateFrame(1, "a", PropertyValue::uint64(1)), reportFrame(20, {2}),
-                                                reportFrame(30, {3}),
-                                                reportFrame(40, {4}), reportFrame(50, {5}),
-                                                stateFrame(60, "a", PropertyValue::uint64(2))};
-    expectSameFrames(written.frames(), expected);
-    expectSameFrames(recording.frames(), expected);
 }
 
 }  // namespace

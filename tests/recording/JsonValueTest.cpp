@@ -65,8 +65,10 @@ TEST(JsonValue, WritingMapsEveryKindAndNeverFails)
     all.set("nan", PropertyValue::float32(std::numeric_limits<float>::quiet_NaN()));
     all.set("bytes", PropertyValue::bytes({0x1F, 0x00}));
     all.set("empty", PropertyValue());
+    all.set("bad\xff", PropertyValue::string("\xc3"));  // text that is not UTF-8
     EXPECT_EQ(JsonValue::write(PropertyValue::dictionary(all), false),
-              R"({"i32":-5,"u32":7,"f32":0.3,"f64":2.0,"nan":null,"bytes":"1f 00 ","empty":null})");
+              R"({"i32":-5,"u32":7,"f32":0.3,"f64":2.0,"nan":null,"bytes":"1f 00 ","empty":null,)"
+              "\"bad\xef\xbf\xbd\":\"\xef\xbf\xbd\"}");
     EXPECT_EQ(JsonValue::write(PropertyValue::array({PropertyValue::uint64(1)}), true), "[\n  1\n]");
 }
 

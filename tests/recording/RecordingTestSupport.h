@@ -2,10 +2,15 @@
 
 #include "pipeline/InputReport.h"
 #include "pipeline/PipelineInput.h"
+#include "recording/ContainerStream.h"
 #include "recording/PipelineRecording.h"
+
+#include <unistd.h>
 
 #include <array>
 #include <cstdint>
+#include <cstdio>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -53,6 +58,24 @@ inline Frame reportFrame(std::uint64_t timestampNs, std::vector<std::uint8_t> by
     frame.timestampNs = timestampNs;
     frame.report = std::move(bytes);
     return frame;
+}
+
+// Frames of a container text as ContainerStream hands them over, from a
+// file in memory (seekable, like a file on disk).
+inline PipelineRecording::FrameList streamFrames(const std::string& text, std::size_t* handedBeforeFault = nullptr)
+{
+    const std::unique_ptr<std::FILE, int (*)(std::FILE*)> file(std::tmpfile(), &std::fclose);
+    std::fwrite(text.data(), 1, text.size(), file.get());
+    std::fflush(file.get());
+    ::lseek(::fileno(file.get()), 0, SEEK_SET);
+    PipelineRecording::FrameList frames;
+    try {
+        VeltoTouch::ContainerStream::read(::fileno(file.get()), [&](Frame&& frame) { frames.push_back(std::move(frame)); });
+    } catch (...) {
+        if (handedBeforeFault) *handedBeforeFault = frames.size();
+        throw;
+    }
+    return frames;
 }
 
 // A PipelineInput that remembers every call, in order, as text, plus the
