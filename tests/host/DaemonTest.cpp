@@ -8,9 +8,10 @@
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <atomic>
+#include <string>
 #include <thread>
+#include <vector>
 
 using namespace VeltoHost;
 using namespace std::chrono_literals;

@@ -1,6 +1,5 @@
 #include "RecordingTestSupport.h"
 
-#include "platform/PropertyDictionary.h"
 #include "recording/ContainerStream.h"
 #include "recording/JsonValue.h"
 
@@ -9,7 +8,6 @@
 #include <unistd.h>
 
 #include <cstdio>
-#include <limits>
 #include <memory>
 #include <optional>
 #include <stdexcept>
@@ -19,7 +17,6 @@
 namespace {
 
 using namespace RecordingTestSupport;
-using VeltoHost::PropertyDictionary;
 using VeltoTouch::JsonValue;
 
 void expectSameFrames(const PipelineRecording::FrameList& actual, const PipelineRecording::FrameList& expected)
