@@ -1,5 +1,3 @@
-#include "GestureScript.h"
-#include "ToolError.h"
 #include "ToolProcessSupport.h"
 #include "ToolTestSupport.h"
 
@@ -8,64 +6,65 @@
 #include <algorithm>
 #include <fstream>
 #include <string>
-#include <vector>
 
-using namespace VeltoTool;
 using namespace VeltoTool::Testing;
 
 namespace {
 
-const std::string kExamples = VELTO_EXAMPLES_DIR;
-
-// Name and script of each example, as scripts/make-examples reads them.
-std::vector<std::pair<std::string, std::string>> exampleScripts()
-{
-    std::vector<std::pair<std::string, std::string>> out;
-    std::ifstream in(kExamples + "/gestures.txt");
-    for (std::string line; std::getline(in, line);) {
-        if (line.empty() || line[0] == '#') continue;
-        const auto colon = line.find(':');
-        if (colon == std::string::npos) continue;
-        std::string script = line.substr(colon + 1);
-        if (!script.empty() && script[0] == ' ') script.erase(0, 1);
-        out.emplace_back(line.substr(0, colon), script);
-    }
-    return out;
-}
-
+// Each line NAME: SCRIPT of the examples' list, as scripts/make-examples reads it.
 TEST(SynthCommand, ExamplesRegenerateByteForByte)
 {
     TempDir dir;
-    const auto scripts = exampleScripts();
-    ASSERT_GE(scripts.size(), 5u);
-    for (const auto& [name, script] : scripts) {
+    std::ifstream in(kExamples + "/gestures.txt");
+    int examples = 0;
+    for (std::string line; std::getline(in, line);) {
+        const auto colon = line.find(':');
+        if (line.empty() || line[0] == '#' || colon == std::string::npos) continue;
+        const std::string name = line.substr(0, colon);
         const fs::path output = dir.file(name + ".json");
-        const ToolRun run = runTool({"synth", script, "-o", output.string()});
+        const ToolRun run = runTool({"synth", line.substr(line.find_first_not_of(' ', colon + 1)), "-o", output.string()});
         ASSERT_EQ(run.status, 0) << name << ": " << run.err;
         EXPECT_TRUE(readFile(output) == readFile(kExamples + "/" + name + ".json")) << name;
+        ++examples;
     }
+    EXPECT_GE(examples, 5);
 }
 
-TEST(SynthCommand, DurationsThatAreNotLengthsOfTimeAreScriptErrors)
+TEST(SynthCommand, ScriptErrorsNameTheLineAndTheProblemAndWriteNothing)
 {
-    const char* scripts[] = {"tap top nanms", "tap top infs", "idle -1s", "idle -0.5ms", "idle 1e30s",
-                             "idle 1e-400s", "palm nans",  "hold top 1s reset@nanms", "hold top 1s reset@-1ms"};
+    const auto longer = [](const std::string& duration) {
+        return "script line 1: invalid duration \"" + duration + "\" (for example 600ms or 1.2s, at most an hour)";
+    };
+    const std::pair<const char*, std::string> cases[] = {
+        {"tap left", "script line 1: unknown region \"left\" (top, middle or bottom)"},
+        {"tap top\nwave 2s", "script line 2: unknown gesture \"wave\" (tap, hold, slide, palm, idle, noise, reset)"},
+        {"idle 5", "script line 1: invalid duration \"5\" (for example 600ms or 1.2s)"},
+        {"hold top", "script line 1: expected \"hold REGION DURATION [reset@TIME]\""},
+        {"hold top 1s reset@2s", "script line 1: reset@ must fall within the hold"},
+        // Durations that are not lengths of time.
+        {"tap top nanms", longer("nanms")},
+        {"tap top infs", longer("infs")},
+        {"idle -1s", longer("-1s")},
+        {"idle -0.5ms", longer("-0.5ms")},
+        {"idle 1e30s", longer("1e30s")},
+        {"idle 1e-400s", longer("1e-400s")},
+        {"palm nans", longer("nans")},
+        {"hold top 1s reset@nanms", longer("nanms")},
+        {"hold top 1s reset@-1ms", longer("-1ms")},
+    };
     TempDir dir;
-    for (const char* script : scripts) {
-        const ToolRun run = runTool({"synth", script, "-o", dir.file("out.json").string()});
+    const fs::path output = dir.file("out.json");
+    for (const auto& [script, message] : cases) {
+        const ToolRun run = runTool({"synth", script, "-o", output.string()});
         EXPECT_EQ(run.status, 1) << script;
-        EXPECT_EQ(run.err.rfind("veltotouch: script line 1: invalid duration \"", 0), 0u) << script << ": " << run.err;
-        EXPECT_FALSE(fs::exists(dir.file("out.json"))) << script << ": a faulty script writes nothing";
+        EXPECT_EQ(run.err, "veltotouch: " + message + "\n");
+        EXPECT_FALSE(fs::exists(output)) << script << ": a faulty script writes nothing";
     }
-}
-
-TEST(SynthCommand, AScriptErrorLeavesAnExistingOutputAlone)
-{
-    TempDir dir;
-    const fs::path output = dir.file("kept.json", "previous content");
-    const ToolRun run = runTool({"synth", "tap left", "-o", output.string()});
-    EXPECT_EQ(run.status, 1);
+    std::ofstream(output) << "previous content";
+    EXPECT_EQ(runTool({"synth", "tap left", "-o", output.string()}).status, 1);
     EXPECT_EQ(readFile(output), "previous content");
+
+    EXPECT_EQ(runTool({"synth", "# comment only\n\n tap top ; idle 1.5s # trailing", "-o", output.string()}).status, 0);
 }
 
 // The tool runs with 64 MiB of address space: holding a five-minute script

@@ -7,6 +7,7 @@
 #include <nlohmann/json.hpp>
 #include <unistd.h>
 
+#include <algorithm>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
@@ -16,6 +17,22 @@
 namespace VeltoTool::Testing {
 
 namespace fs = std::filesystem;
+using nlohmann::json;
+
+#ifdef VELTO_EXAMPLES_DIR
+inline const std::string kExamples = VELTO_EXAMPLES_DIR;
+
+// The names of the sample recordings (examples/NAME.json), in order.
+inline std::vector<std::string> exampleNames()
+{
+    std::vector<std::string> names;
+    for (const auto& entry : fs::directory_iterator(kExamples)) {
+        if (entry.path().extension() == ".json") names.push_back(entry.path().stem().string());
+    }
+    std::sort(names.begin(), names.end());
+    return names;
+}
+#endif
 
 struct ToolRun {
     int status;
@@ -68,17 +85,24 @@ private:
     fs::path _path;
 };
 
+// Every line of the text, parsed as JSON (throws on a line that is not).
+inline std::vector<json> jsonLinesOf(const std::string& text)
+{
+    std::vector<json> lines;
+    std::istringstream in(text);
+    for (std::string line; std::getline(in, line);) lines.push_back(json::parse(line));
+    return lines;
+}
+
 // Gesture, region and frame of each event line of --jsonl output; time stamps
 // differ between runs and are left out.
 inline std::vector<std::string> eventsOf(const std::string& jsonLines)
 {
     std::vector<std::string> out;
-    std::istringstream text(jsonLines);
-    for (std::string line; std::getline(text, line);) {
-        auto json = nlohmann::json::parse(line);
-        if (!json.contains("gesture")) continue;
-        out.push_back(json["gesture"].get<std::string>() + " " + json.value("region", "") + " " +
-                      std::to_string(json.value("frame", 0)));
+    for (const json& line : jsonLinesOf(jsonLines)) {
+        if (!line.contains("gesture")) continue;
+        out.push_back(line["gesture"].get<std::string>() + " " + line.value("region", "") + " " +
+                      std::to_string(line.value("frame", 0)));
     }
     return out;
 }
