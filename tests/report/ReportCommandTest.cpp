@@ -7,8 +7,6 @@
 namespace VeltoTool::Testing {
 namespace {
 
-const std::string kExamples = VELTO_EXAMPLES_DIR;
-
 // The data the page draws from, as embedded in it.
 nlohmann::json payloadOf(const std::string& html)
 {

@@ -12,16 +12,6 @@
 namespace VeltoTool::Testing {
 namespace {
 
-std::vector<std::string> examples()
-{
-    std::vector<std::string> names;
-    for (const auto& entry : fs::directory_iterator(VELTO_EXAMPLES_DIR)) {
-        if (entry.path().extension() == ".json") names.push_back(entry.path().stem().string());
-    }
-    std::sort(names.begin(), names.end());
-    return names;
-}
-
 std::vector<std::vector<std::string>> matches(const std::string& text, const std::string& pattern)
 {
     std::vector<std::vector<std::string>> out;
@@ -59,7 +49,7 @@ std::string dumpedDescription(const std::string& dump, std::int64_t frame)
     return "(frame " + std::to_string(frame) + " not in the dump)";
 }
 
-class ReportPageBrowserTest : public ::testing::TestWithParam<std::string> {
+class ReportPageTest : public ::testing::Test {
 protected:
     void SetUp() override
     {
@@ -71,7 +61,7 @@ protected:
     fs::path report(const std::string& example)
     {
         const fs::path page = dir.file(example + ".html");
-        const ToolRun run = runTool({"report", std::string(VELTO_EXAMPLES_DIR) + "/" + example + ".json", "-o", page});
+        const ToolRun run = runTool({"report", kExamples + "/" + example + ".json", "-o", page});
         EXPECT_EQ(run.status, 0) << run.err;
         return page;
     }
@@ -80,13 +70,16 @@ protected:
     std::optional<HeadlessChromium> browser;
 };
 
+class ReportPageBrowserTest : public ReportPageTest, public ::testing::WithParamInterface<std::string> {};
+using ReportPageScreenshotTest = ReportPageTest;
+
 // The page of each example, opened at its last gesture's frame: drawn, every
 // event of replay --jsonl listed in order, the counters of --get, the frame's
 // description as the recogniser's dump has it, nothing fetched, no error.
 TEST_P(ReportPageBrowserTest, PageShowsWhatReplaySees)
 {
     const std::string example = GetParam();
-    const std::string recording = std::string(VELTO_EXAMPLES_DIR) + "/" + example + ".json";
+    const std::string recording = kExamples + "/" + example + ".json";
     const fs::path page = report(example);
     const std::string html = readFile(page);
     EXPECT_FALSE(std::regex_search(html, std::regex(R"((https?:|ftp:)//|\bsrc\s*=|\bhref\s*=|url\(|@import)",
@@ -96,12 +89,10 @@ TEST_P(ReportPageBrowserTest, PageShowsWhatReplaySees)
     const ToolRun replay = runTool({"replay", recording, "--jsonl", "--get", "Algs.EventStats"});
     ASSERT_EQ(replay.status, 0) << replay.err;
     std::int64_t lastFrame = 0;
-    nlohmann::json counters;
-    std::istringstream lines(replay.out);
-    for (std::string line; std::getline(lines, line);) {
-        const auto json = nlohmann::json::parse(line);
-        if (json.contains("frame") && json["frame"].get<std::int64_t>() > 0) lastFrame = json["frame"];
-        if (json.contains("key")) counters = json["value"];
+    json counters;
+    for (const json& line : jsonLinesOf(replay.out)) {
+        if (line.contains("frame") && line["frame"].get<std::int64_t>() > 0) lastFrame = line["frame"];
+        if (line.contains("key")) counters = line["value"];
     }
     const ToolRun dump = runTool({"replay", recording, "--dump"});
     ASSERT_EQ(dump.status, 0) << dump.err;
@@ -121,7 +112,7 @@ TEST_P(ReportPageBrowserTest, PageShowsWhatReplaySees)
     }
     EXPECT_EQ(listed, eventsOf(replay.out));
 
-    nlohmann::json shown;
+    json shown;
     for (const auto& row :
          matches(dom, R"re(<tr data-group="([^"]*)" data-key="([^"]*)"><td>[^<]*</td><td>[^<]*</td><td class="num">([^<]*)</td>)re")) {
         shown[row[0]][row[1]] = std::stoull(row[2]);
@@ -133,7 +124,7 @@ TEST_P(ReportPageBrowserTest, PageShowsWhatReplaySees)
     EXPECT_EQ(unescapeHtml(description[0][0]), dumpedDescription(dump.out, lastFrame));
 }
 
-INSTANTIATE_TEST_SUITE_P(Examples, ReportPageBrowserTest, ::testing::ValuesIn(examples()),
+INSTANTIATE_TEST_SUITE_P(Examples, ReportPageBrowserTest, ::testing::ValuesIn(exampleNames()),
                          [](const auto& info) {
                              std::string name = info.param;
                              std::replace(name.begin(), name.end(), '-', '_');
@@ -143,17 +134,11 @@ INSTANTIATE_TEST_SUITE_P(Examples, ReportPageBrowserTest, ::testing::ValuesIn(ex
 // A screenshot of the demo's page is a picture, not an empty page: the
 // browser itself measures the variance of its pixels' brightness. With
 // VELTOTOUCH_REPORT_SCREENSHOT set, the picture is kept there (the README's).
-TEST(ReportPageScreenshotTest, DemoPageIsDrawn)
+TEST_F(ReportPageScreenshotTest, DemoPageIsDrawn)
 {
-    const auto program = HeadlessChromium::path();
-    if (!program) GTEST_SKIP() << "chromium is not installed (scripts/install-deps installs it)";
-    TempDir dir;
-    HeadlessChromium browser(*program, dir.path());
-    const fs::path page = dir.file("demo.html");
-    const ToolRun report = runTool({"report", std::string(VELTO_EXAMPLES_DIR) + "/demo.json", "-o", page});
-    ASSERT_EQ(report.status, 0) << report.err;
+    const fs::path page = report("demo");
     const fs::path png = dir.file("demo.png");
-    const auto shot = browser.screenshot("file://" + page.string(), png);
+    const auto shot = browser->screenshot("file://" + page.string(), png);
     ASSERT_TRUE(shot.exited) << shot.err;
     EXPECT_EQ(shot.pageRequests, std::vector<std::string>{});
 
@@ -184,7 +169,7 @@ function measure() {
 if (image.complete) measure(); else image.onload = measure;
 </script></body>)";
     const fs::path checkPage = dir.file("check.html", checker);
-    const auto check = browser.dumpDom("file://" + checkPage.string());
+    const auto check = browser->dumpDom("file://" + checkPage.string());
     ASSERT_TRUE(check.exited) << check.err;
     const auto size = matches(check.out, R"re(data-size="(\d+)x(\d+)")re");
     const auto variance = matches(check.out, R"re(data-variance="(\d+)")re");
