@@ -1,15 +1,11 @@
 // The diagnostic texts, to the character.
-#include "algs/FrameBuilder.h"
+#include "algs/PipelineHarness.h"
 #include "pipeline/Util.h"
-#include "platform/CaptureLogSink.h"
 
 #include <gtest/gtest.h>
 
 namespace VeltoTouch::Test {
 namespace {
-
-using VeltoHost::CaptureLogSink;
-using VeltoHost::LogLevel;
 
 std::vector<std::string> lines(const std::string& text)
 {
@@ -50,8 +46,7 @@ TEST(StringFromImage, DrawsEachPadsNumberOverTheLayout)
 
 TEST(StateDescriptions, PadsGroupsAndThePhaseOfTheTouch)
 {
-    PipelineHarness harness;
-    harness.builder = FrameBuilder(1, 970);
+    PipelineHarness harness(970);
     harness.idle(3);
     harness.press({{'K', 248}, {'A', 12}}, 1);  // starts at 1000
     const Algs& algs = harness.algs();
@@ -80,27 +75,6 @@ TEST(StateDescriptions, PadsGroupsAndThePhaseOfTheTouch)
     harness.idle(100);
     const std::string quiet = algs.touchStateDescription(readings, 2200);
     EXPECT_EQ(quiet.substr(quiet.size() - 2), "] ");
-}
-
-TEST(StateDescriptions, WrittenToTheDebugLogEveryFrameOnlyWhenEnabled)
-{
-    PipelineHarness harness;
-    {
-        CaptureLogSink::Scope capture(LogLevel::Default);
-        harness.idle(2);
-        EXPECT_TRUE(capture.sink().messages("Algs").empty());
-    }
-    CaptureLogSink::Scope capture(LogLevel::Debug);
-    harness.press({{'K', 300}}, 1);  // frame 3 at 1020 ms
-    const std::vector<std::string> messages = capture.sink().messages("Algs");
-    ASSERT_EQ(messages.size(), 3u);
-    EXPECT_EQ(messages[0].rfind("Frame 3 @1020ms, *** Event Stats ***\n", 0), 0u) << messages[0];
-    EXPECT_NE(messages[0].find("numTaps"), std::string::npos);
-    EXPECT_EQ(messages[1], "Frame 3 @1020ms, *** Touch State Description ***\n" +
-                               harness.algs().touchStateDescription(Algs::Readings{0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 300},
-                                                                    1020));
-    EXPECT_EQ(messages[2].rfind("Frame 3 @1020ms, *** Virtual State Description ***\nts=", 0), 0u);
-    EXPECT_NE(messages[2].find("STARTTOUCH 0ms ActiveRegion=1"), std::string::npos);
 }
 
 }  // namespace

@@ -55,18 +55,6 @@ TEST(Pixel, ActivationHysteresisAndNoise)
     EXPECT_EQ(noise.floorRatio, 0.0f);  // the activation state carries over
 }
 
-TEST(Pixel, RegionsOfThePads)
-{
-    const char* expected = "MMMMMMTTTTMBBBB";
-    for (int i = 0; i < 15; ++i) {
-        const PixelRegion region = Pixel::regionOfPad(i);
-        const char letter = region == PixelRegion::Top ? 'T' : region == PixelRegion::Bottom ? 'B' : 'M';
-        EXPECT_EQ(letter, expected[i]) << "pad " << i;
-    }
-    EXPECT_EQ(Pixel::regionOfPad(15), PixelRegion::None);
-    EXPECT_EQ(Pixel::regionOfPad(-1), PixelRegion::None);
-}
-
 std::vector<Pixel> padsWithValues(std::initializer_list<std::pair<char, int>> values)
 {
     std::vector<Pixel> pads;
@@ -78,8 +66,6 @@ std::vector<Pixel> padsWithValues(std::initializer_list<std::pair<char, int>> va
 TEST(VirtualImage, SumsAboveNoiseAndKeepsTheStrongestMember)
 {
     VirtualImage image;
-    EXPECT_EQ(image.maxIndex[0], 0);
-    EXPECT_EQ(image.maxIndex[15], 6);
     image.updateValues(padsWithValues({{'A', 80}, {'B', 120}, {'E', 50}, {'G', 100}, {'H', 100}}));
     EXPECT_EQ(image.values[0], 200);   // "ABE" without E, which is noise
     EXPECT_EQ(image.maxIndex[0], 1);   // B
