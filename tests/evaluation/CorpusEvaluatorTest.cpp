@@ -13,6 +13,15 @@ using namespace VeltoTouch;
 
 namespace {
 
+std::string readAll(const std::string& path)
+{
+    std::ostringstream text;
+    text << std::ifstream(path).rdbuf();
+    return text.str();
+}
+
+PipelineRecording load(const std::string& path) { return PipelineRecording(std::string_view(readAll(path))); }
+
 // The sample recordings, synthesised with their truth beside them.
 std::vector<CorpusEvaluator::Item> examples()
 {
@@ -20,21 +29,10 @@ std::vector<CorpusEvaluator::Item> examples()
     for (const auto& entry : std::filesystem::directory_iterator(VELTO_EXAMPLES_DIR)) {
         const std::string path = entry.path().string();
         if (entry.path().extension() != ".json") continue;
-        std::ifstream in(TruthRecord::pathBeside(path));
-        std::ostringstream text;
-        text << in.rdbuf();
-        corpus.push_back({path, TruthRecord::parseLines(text.str())});
+        corpus.push_back({path, TruthRecord::parseLines(readAll(TruthRecord::pathBeside(path)))});
     }
     std::sort(corpus.begin(), corpus.end(), [](const auto& a, const auto& b) { return a.recording < b.recording; });
     return corpus;
-}
-
-PipelineRecording load(const std::string& path)
-{
-    std::ifstream in(path);
-    std::ostringstream text;
-    text << in.rdbuf();
-    return PipelineRecording(std::string_view(text.str()));
 }
 
 }  // namespace

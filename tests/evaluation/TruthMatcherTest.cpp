@@ -20,13 +20,7 @@ std::uint64_t ms(std::uint64_t milliseconds) { return Util::machTimeFromNanoseco
 
 TruthRecord truth(Kind kind, Region region, Region to, std::uint64_t startMs, std::uint64_t endMs)
 {
-    TruthRecord record;
-    record.kind = kind;
-    record.region = region;
-    record.to = to;
-    record.start = ms(startMs);
-    record.end = ms(endMs);
-    return record;
+    return {kind, region, to, ms(startMs), ms(endMs)};
 }
 
 RecordingReplay::TimedGesture event(Gesture::Kind kind, Region region, std::uint64_t atMs)
