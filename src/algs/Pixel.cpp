@@ -18,20 +18,19 @@ void Pixel::updatePixelState(int raw, float activationThreshold)
 {
     value = static_cast<std::int32_t>(static_cast<float>(raw) * gain);
 
+    ratio = static_cast<float>(value) / activationThreshold;
+
     // A pad that is on stays on until it falls well below its peak; a pad that
     // is off must climb well above its lowest level since release. Together
     // these ride out slow baseline drift without chattering at the threshold.
-    // A floor quotient that is not a number leaves the threshold at 1.0.
-    double threshold = 0.0;
+    // The reactivation level is never below 1.0 (a floor quotient that is not
+    // a number leaves it at 1.0), so an idle pad at or below 1.0 stays off
+    // without the division: this runs for every pad and group every frame.
     if (active) {
-        threshold = peakRatio * kHysteresis;
+        active = ratio > peakRatio * kHysteresis;
     } else {
-        const double reactivation = floorRatio / static_cast<float>(kHysteresis);
-        threshold = reactivation > 1.0 ? reactivation : 1.0;
+        active = ratio > 1.0 && !(ratio <= floorRatio / static_cast<float>(kHysteresis));
     }
-
-    ratio = static_cast<float>(value) / activationThreshold;
-    active = ratio > threshold;
     if (active) {
         peakRatio = std::max(ratio, peakRatio);
         floorRatio = ratio;

@@ -40,16 +40,39 @@ std::pair<std::int32_t, std::int32_t> twoLargest(const std::int32_t* values, std
 {
     std::int32_t first = std::max(values[0], values[1]);
     std::int32_t second = std::min(values[0], values[1]);
+    // Branch-free: min and max keep the same pair as comparing and shifting.
     for (std::size_t i = 2; i < count; ++i) {
-        if (values[i] > first) {
-            second = first;
-            first = values[i];
-        } else if (values[i] > second) {
-            second = values[i];
-        }
+        second = std::max(second, std::min(first, values[i]));
+        first = std::max(first, values[i]);
     }
     return {first, second};
 }
+
+struct Profile {
+    const std::int32_t* values;
+    std::size_t count;
+    const float* means;
+    const float* scales;
+    const float* weights;
+};
+
+// One fused multiply-add per rank. std::fma rounds once wherever it runs,
+// so the copy built for processors with the instruction gives the very same
+// score as the portable one, which calls the C library for it.
+[[gnu::always_inline]] inline float weightedSum(const Profile& profile)
+{
+    float sum = 0.0f;
+    for (std::size_t rank = 0; rank < profile.count; ++rank) {
+        const float standardised =
+            (static_cast<float>(profile.values[rank]) - profile.means[rank]) / profile.scales[rank];
+        sum = std::fma(standardised, profile.weights[rank], sum);
+    }
+    return sum;
+}
+
+[[gnu::target("fma")]] float weightedSumWithFmaInstruction(const Profile& profile) { return weightedSum(profile); }
+
+float weightedSumPortable(const Profile& profile) { return weightedSum(profile); }
 
 }  // namespace
 
@@ -80,10 +103,9 @@ void SVM::updateSVMScore(const std::vector<Pixel>& pixels, const std::vector<Vir
 
     std::sort(profile.begin(), profile.begin() + static_cast<std::ptrdiff_t>(count), std::greater<>());
 
-    for (std::size_t rank = 0; rank < count; ++rank) {
-        const float standardised = (static_cast<float>(profile[rank]) - means[rank]) / scales[rank];
-        score = std::fma(standardised, weights[rank], score);
-    }
+    static const bool hasFmaInstruction = __builtin_cpu_supports("fma");
+    const Profile sorted{profile.data(), count, means.data(), scales.data(), weights.data()};
+    score = hasFmaInstruction ? weightedSumWithFmaInstruction(sorted) : weightedSumPortable(sorted);
     score += bias;
 }
 

@@ -51,12 +51,14 @@ void VirtualImage::updateValues(const std::vector<Pixel>& pixels)
         const GroupPads& members = _groupPads[j];
         for (std::size_t m = 0; m < members.count; ++m) {
             const int pad = members.pads[m];
+            // Without branches: whether a pad is above noise changes from
+            // frame to frame and would be mispredicted often.
             const std::int32_t padValue = pads[pad].value;
-            if (padValue <= Pixel::kNoiseLevel) continue;
-            sum += padValue;
+            const bool counts = padValue > Pixel::kNoiseLevel;
+            sum += counts ? padValue : 0;
             // The first strongest member wins a tie, and the one already
             // recorded keeps it, so the index does not flicker between equals.
-            if (padValue > pads[strongest].value) strongest = pad;
+            strongest = counts && padValue > pads[strongest].value ? pad : strongest;
         }
         values[j] = sum;
     }
