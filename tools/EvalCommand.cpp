@@ -283,7 +283,11 @@ int EvalCommand::run(const Options& options, std::ostream& out, std::ostream& er
         progress = [&](std::size_t done, std::size_t total) { (*bar)(done, total); };
     }
     const std::vector<EvaluationResult> results = CorpusEvaluator::run(
-        corpus, rowSettings, workers, [](const std::string& path) { return ToolFiles::readRecording(path); }, progress);
+        corpus, rowSettings, workers,
+        [](const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame) {
+            ToolFiles::streamRecording(path, onFrame);
+        },
+        progress);
     bar.reset();
     for (std::size_t i = 0; i < grid.size(); ++i) report.rows.push_back({grid[i], results[i]});
     print(report, options.json, out);

@@ -20,7 +20,12 @@ std::string readAll(const std::string& path)
     return text.str();
 }
 
-PipelineRecording load(const std::string& path) { return PipelineRecording(std::string_view(readAll(path))); }
+// The whole-text reader (the tool streams; the two agree frame for frame).
+void load(const std::string& path, const ContainerStream::FrameHandler& onFrame)
+{
+    const PipelineRecording recording(std::string_view(readAll(path)));
+    for (PipelineRecording::Frame frame : recording.frames()) onFrame(std::move(frame));
+}
 
 // The sample recordings, synthesised with their truth beside them.
 std::vector<CorpusEvaluator::Item> examples()
@@ -57,6 +62,12 @@ TEST(CorpusEvaluator, SweepRowsEqualSeparateEvaluations)
     }
     // The settings reach the pipeline: the hold timeout moves the result.
     EXPECT_NE(rows[0], rows[4]);
+
+    // Fewer recordings than it takes to keep the workers busy: each read
+    // feeds a share of the settings, and the rows stay the same.
+    const std::vector<CorpusEvaluator::Item> one = {corpus[1]};
+    const auto shared = CorpusEvaluator::run(one, grid, 2, load);
+    for (std::size_t i = 0; i < grid.size(); ++i) EXPECT_EQ(shared[i], CorpusEvaluator::run(one, {grid[i]}, 1, load).front());
 }
 
 TEST(CorpusEvaluator, ShardsMergedEqualOneRun)
