@@ -125,14 +125,17 @@ void Algs::processTouchFrame(const Readings& readings, unsigned int frameNumber,
     if (log.isEnabled(LogLevel::Debug)) writeDumps(readings, frameNumber, timeMs);
 }
 
-void Algs::updatePixels(const Readings& readings)
+// Flattened: every pad and group is updated every report, and a call per
+// element costs as much as the update (a release build inlines the elements'
+// code from their own files).
+[[gnu::flatten]] void Algs::updatePixels(const Readings& readings)
 {
     for (std::size_t pad = 0; pad < readings.size(); ++pad) {
         pixels[pad].updatePixelState(readings[pad], handStats.activationThreshold);
     }
 }
 
-void Algs::updateVirtualPixels()
+[[gnu::flatten]] void Algs::updateVirtualPixels()
 {
     for (std::size_t group = 0; group < virtualImage.groups.size(); ++group) {
         // The group sum travels as a pad reading would: a signed 16-bit number.
