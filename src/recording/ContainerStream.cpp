@@ -8,6 +8,7 @@
 #include <rapidjson/reader.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <cstring>
 #include <vector>
 #include <poll.h>
@@ -63,6 +64,34 @@ public:
         return c;
     }
     std::size_t Tell() const { return _consumed + static_cast<std::size_t>(_current - _buffer.data()); }
+
+    // Takes the run of plain string bytes (none of '"', '\\' or a control
+    // character) that starts here and lies in what has been read, leaving the
+    // last byte read for Take(), which reads on. Nearly all of a container is
+    // the text of hex reports: the parser copies each run in one piece
+    // instead of byte by byte.
+    std::string_view takePlainRun()
+    {
+        const Ch* const start = _current;
+        const Ch* run = start;
+        // Eight bytes at a time while none of them ends the run (the usual
+        // tests for a zero byte, less than 0x20, and a quote or backslash).
+        constexpr std::uint64_t kOnes = 0x0101010101010101u;
+        constexpr std::uint64_t kHighs = 0x8080808080808080u;
+        const auto hasZero = [](std::uint64_t v) { return ((v - kOnes) & ~v & kHighs) != 0; };
+        while (_last - run >= 8) {
+            std::uint64_t word = 0;
+            std::memcpy(&word, run, sizeof word);
+            if (((word - 0x20 * kOnes) & ~word & kHighs) != 0 || hasZero(word ^ ('"' * kOnes)) ||
+                hasZero(word ^ ('\\' * kOnes))) {
+                break;
+            }
+            run += 8;
+        }
+        while (run < _last && static_cast<unsigned char>(*run) >= 0x20 && *run != '"' && *run != '\\') ++run;
+        _current += run - start;
+        return {start, static_cast<std::size_t>(run - start)};
+    }
     // The first bytes, when there are four (a byte order mark is looked for).
     const Ch* Peek4() const { return _current + 4 <= _last ? _current : nullptr; }
 
@@ -114,6 +143,29 @@ private:
     std::size_t _consumed = 0;
     bool _ended = false;
 };
+
+}  // namespace
+}  // namespace VeltoTouch
+
+namespace rapidjson {
+
+// The reader's hook for copying a string's plain bytes in bulk, which it
+// provides only for text in memory, given for the file input. Only the run
+// is copied: escapes, the closing quote and control characters are left to
+// the reader, byte by byte, with its own errors.
+template <>
+template <>
+inline void Reader::ScanCopyUnescapedString<VeltoTouch::DescriptorInput, Reader::StackStream<char>>(
+    VeltoTouch::DescriptorInput& input, Reader::StackStream<char>& output)
+{
+    const std::string_view run = input.takePlainRun();
+    if (!run.empty()) std::memcpy(output.Push(static_cast<SizeType>(run.size())), run.data(), run.size());
+}
+
+}  // namespace rapidjson
+
+namespace VeltoTouch {
+namespace {
 
 // Whether text is well-formed UTF-8 (no overlong forms, no surrogates,
 // nothing past U+10FFFF), as the whole-text reader requires of strings.
