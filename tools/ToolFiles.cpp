@@ -1,6 +1,7 @@
 #include "ToolFiles.h"
 
 #include "ToolError.h"
+#include "recording/ContainerReadAhead.h"
 #include "recording/JsonValue.h"
 
 #include <fcntl.h>
@@ -146,7 +147,7 @@ std::optional<std::uint64_t> ToolFiles::streamRecording(std::FILE* file, const s
     std::uint64_t version = 0;
     try {
         // Read through the descriptor: stdio's buffer is never used.
-        version = VeltoTouch::ContainerStream::read(::fileno(file), onFrame, stopRequested);
+        version = VeltoTouch::ContainerReadAhead::read(::fileno(file), onFrame, stopRequested);
     } catch (const ToolError&) {
         throw;
     } catch (const std::exception& error) {

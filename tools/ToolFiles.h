@@ -41,7 +41,8 @@ public:
     static File openRecording(const std::string& path);
 
     // The recording read as it arrives, each frame handed over as soon as it
-    // is complete (ContainerStream), so that its length does not matter.
+    // is complete (ContainerStream), so that its length does not matter; the
+    // parsing runs on a thread of its own, ahead of onFrame (ContainerReadAhead).
     // Failures as readRecording's, raised where they are reached: the frames
     // before a fault have been handed over. Returns the container's version,
     // or nothing when the read ended because a stop was requested (a signal
