@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cmath>
 #include <functional>
+#include <limits>
 #include <utility>
 
 namespace VeltoTouch {
@@ -35,15 +36,24 @@ constexpr RankTable kWeights = {
 // Offset of the decision function.
 constexpr float kBias = 2.0083f;
 
-// The largest and second largest of at least two values.
-std::pair<std::int32_t, std::int32_t> twoLargest(const std::int32_t* values, std::size_t count)
+// The largest and second largest of the first kRankCount element values
+// (pads, then groups), as in the profile. Branch-free: min and max keep the
+// same pair as comparing and shifting.
+std::pair<std::int32_t, std::int32_t> twoLargest(const std::vector<Pixel>& pixels,
+                                                 const std::vector<VirtualPixel>& virtualPixels)
 {
-    std::int32_t first = std::max(values[0], values[1]);
-    std::int32_t second = std::min(values[0], values[1]);
-    // Branch-free: min and max keep the same pair as comparing and shifting.
-    for (std::size_t i = 2; i < count; ++i) {
-        second = std::max(second, std::min(first, values[i]));
-        first = std::max(first, values[i]);
+    std::int32_t first = std::numeric_limits<std::int32_t>::min();
+    std::int32_t second = first;
+    std::size_t count = 0;
+    const auto take = [&](std::int32_t value) {
+        second = std::max(second, std::min(first, value));
+        first = std::max(first, value);
+    };
+    for (const Pixel& pixel : pixels) {
+        if (count++ < SVM::kRankCount) take(pixel.value);
+    }
+    for (const VirtualPixel& pixel : virtualPixels) {
+        if (count++ < SVM::kRankCount) take(pixel.value);
     }
     return {first, second};
 }
@@ -82,24 +92,25 @@ void SVM::updateSVMScore(const std::vector<Pixel>& pixels, const std::vector<Vir
                          float activationThreshold, unsigned int /*frameTime*/)
 {
     score = 0.0f;
-
-    // Only the values take part, so sorting them alone gives the same profile
-    // as sorting copies of the elements.
-    std::array<std::int32_t, kRankCount> profile{};
-    std::size_t count = 0;
-    for (const Pixel& pixel : pixels) {
-        if (count < kRankCount) profile[count++] = pixel.value;
-    }
-    for (const VirtualPixel& pixel : virtualPixels) {
-        if (count < kRankCount) profile[count++] = pixel.value;
-    }
+    const std::size_t count = std::min(pixels.size() + virtualPixels.size(), kRankCount);
     if (count < 2) return;
 
     // Nothing on the surface worth judging: no element past the activation
     // level and fewer than two above noise. Most frames are idle, so this is
-    // decided from the two largest values before anything is sorted.
-    const auto [largest, secondLargest] = twoLargest(profile.data(), count);
+    // decided from the two largest values before any profile is built.
+    const auto [largest, secondLargest] = twoLargest(pixels, virtualPixels);
     if (!(static_cast<float>(largest) > activationThreshold) && secondLargest <= Pixel::kNoiseLevel) return;
+
+    // Only the values take part, so sorting them alone gives the same profile
+    // as sorting copies of the elements.
+    std::array<std::int32_t, kRankCount> profile{};
+    std::size_t filled = 0;
+    for (const Pixel& pixel : pixels) {
+        if (filled < kRankCount) profile[filled++] = pixel.value;
+    }
+    for (const VirtualPixel& pixel : virtualPixels) {
+        if (filled < kRankCount) profile[filled++] = pixel.value;
+    }
 
     std::sort(profile.begin(), profile.begin() + static_cast<std::ptrdiff_t>(count), std::greater<>());
 

@@ -28,6 +28,8 @@ public:
     std::vector<float> normalizationFactors;
 
 private:
+    // The pads A..O, and the index that fills a three-pad group's fourth slot.
+    static constexpr std::size_t kNoPad = 15;
     // The pads of each group as indices, in the order of its letters.
     struct GroupPads {
         std::array<std::int8_t, 4> pads{};
