@@ -131,7 +131,8 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     replayCommand->add_option("--set", replaySets, "KEY=VALUE: pipeline state before the first frame (VALUE is JSON)")
         ->check(settingCheck());
     replayCommand->add_option("--get", replay.reads, "KEY: pipeline state to print after the last frame");
-    replayCommand->add_flag("--dump", replay.dump, "Print the recogniser's per-frame descriptions");
+    replayCommand->add_flag("--dump", replay.dump,
+                            "Print the recogniser's per-frame descriptions (with --jsonl: its record of each frame)");
     replayCommand->add_flag("--jsonl", replay.jsonLines, "One JSON object per line");
 
     SynthCommand::Options synth;

@@ -1,6 +1,6 @@
 #include "ReplayCommand.h"
 
-#include "AlgsDumpSink.h"
+#include "DecisionDumpWriter.h"
 #include "EventFormatter.h"
 #include "StateArguments.h"
 #include "ToolFiles.h"
@@ -35,10 +35,9 @@ void ReplayCommand::run(const Options& options, std::ostream& out, std::ostream&
         for (const auto& event : events) out << formatter.format(*event) << '\n';
     };
 
-    std::optional<AlgsDumpSink::Scope> dumps;
-    if (options.dump) {
-        dumps.emplace(out, options.jsonLines ? AlgsDumpSink::Format::JsonLines : AlgsDumpSink::Format::Text);
-    }
+    DecisionDumpWriter dumps(out, options.jsonLines ? DecisionDumpWriter::Format::JsonLines
+                                                    : DecisionDumpWriter::Format::Text);
+    if (options.dump) pipeline->setDecisionObserver(&dumps);
 
     VeltoHost::GapCap gapCap(options.maxGapSeconds, [&](const std::string& note) { err << "veltotouch: note: " << note << '\n'; });
     std::function<void(std::uint64_t)> sleep;
@@ -63,7 +62,7 @@ void ReplayCommand::run(const Options& options, std::ostream& out, std::ostream&
         }
         PipelineRecording::playFrame(frame, clock, *firstTimestampNs, speed, sleep, pipeline.get());
     });
-    dumps.reset();
+    pipeline->setDecisionObserver(nullptr);
 
     for (const std::string& key : options.reads) {
         out << formatter.formatState(key, pipeline->getState(key)) << '\n';

@@ -1,10 +1,9 @@
 #include "algs/Algs.h"
 
+#include "algs/DecisionDump.h"
 #include "pipeline/Util.h"
 #include "platform/PropertyDictionary.h"
 
-#include <cstdarg>
-#include <cstdio>
 #include <sstream>
 #include <tuple>
 #include <utility>
@@ -43,28 +42,6 @@ HidEventRef withPhase(HidEventRef event, std::uint16_t phase)
     event->setPhase(phase);
     return event;
 }
-
-// Appends C printf output, so that the dumps match the C library's formatting exactly.
-__attribute__((format(printf, 2, 3))) void appendFormat(std::string& out, const char* format, ...)
-{
-    char buffer[256];
-    va_list args;
-    va_start(args, format);
-    va_list retry;
-    va_copy(retry, args);
-    const int needed = std::vsnprintf(buffer, sizeof buffer, format, args);
-    va_end(args);
-    if (needed >= 0 && static_cast<std::size_t>(needed) < sizeof buffer) {
-        out.append(buffer, static_cast<std::size_t>(needed));
-    } else if (needed >= 0) {
-        std::string large(static_cast<std::size_t>(needed) + 1, '\0');
-        std::vsnprintf(large.data(), large.size(), format, retry);
-        out.append(large.data(), static_cast<std::size_t>(needed));
-    }
-    va_end(retry);
-}
-
-const char* onMark(const Pixel& pixel) { return pixel.active ? "<==ON" : ""; }
 
 // Index after the factor domain and its dot, read as a stream reads an
 // unsigned number: blanks skipped, digits up to the first other character,
@@ -120,9 +97,20 @@ void Algs::processTouchFrame(const Readings& readings, unsigned int frameNumber,
     if (decision.resetsTouch) Reset();
     if (decision.event) emitEvent(decision.event, frameNumber, events);
 
+    // The record is made only for someone who looks at it; the counters
+    // before the frame are part of it.
+    const bool dumping = log.isEnabled(LogLevel::Debug);
+    if (!decisionObserver && !dumping) {
+        eventStats.update(handStats);
+        return;
+    }
+    const EventStats countersBefore = eventStats;
     eventStats.update(handStats);
-    if (decisionObserver) decisionObserver->frameDecided(decisionRecord(readings, frameNumber, timeMs, decision.event));
-    if (log.isEnabled(LogLevel::Debug)) writeDumps(readings, frameNumber, timeMs);
+    const DecisionRecord record = decisionRecord(readings, frameNumber, timeMs, decision.event, countersBefore);
+    if (decisionObserver) decisionObserver->frameDecided(record);
+    if (dumping) {
+        for (std::string& message : DecisionDump::messages(record)) log.write(LogLevel::Debug, std::move(message));
+    }
 }
 
 // Flattened: every pad and group is updated every report, and a call per
@@ -178,21 +166,6 @@ void Algs::Reset()
     handStats.Reset();
 }
 
-void Algs::writeDumps(const Readings& readings, unsigned int frameNumber, unsigned int timeMs) const
-{
-    if (log.isEnabled(LogLevel::Debug)) {
-        log.debug("Frame %u @%ums, *** Event Stats ***\n%@", frameNumber, timeMs, eventStats.statsDictionary());
-    }
-    if (log.isEnabled(LogLevel::Debug)) {
-        log.debug("Frame %u @%ums, *** Touch State Description ***\n%@", frameNumber, timeMs,
-                  touchStateDescription(readings, timeMs));
-    }
-    if (log.isEnabled(LogLevel::Debug)) {
-        log.debug("Frame %u @%ums, *** Virtual State Description ***\n%@", frameNumber, timeMs,
-                  virtualStateDescription(readings, timeMs));
-    }
-}
-
 PropertyValue Algs::getState(const std::string& key)
 {
     if (key == "EnableHoldSuppression") return PropertyValue::boolean(handStats.enableHoldSuppression);
@@ -233,43 +206,14 @@ void Algs::setState(const std::string& key, PropertyValue value)
     }
 }
 
-std::string Algs::handFeaturesText() const
-{
-    const HandStats& hand = handStats;
-    std::string text;
-    appendFormat(text, "ts=%f, sd=%f, tsd=%f, NonActivePixels=%d, TimeDurationRatio=%f, TapSVMScore=%f, ",
-                 static_cast<double>(hand.touchScore), static_cast<double>(hand.signalPerDuration),
-                 static_cast<double>(hand.signalPerTouchDuration), hand.nonActivePixels,
-                 static_cast<double>(hand.timeDurationRatio), static_cast<double>(hand.tapSVMScore));
-    return text;
-}
-
 std::string Algs::touchStateDescription(const Readings& readings, unsigned int timeMs) const
 {
-    std::string text = handFeaturesText();
-    text += '[';
-    for (std::size_t pad = 0; pad < InputReport::kPadCount; ++pad) {
-        const Pixel& pixel = pixels.at(pad);
-        if (pad > 0) text += ", ";
-        appendFormat(text, "%c=%4d %4d%s", 'A' + pixel.index, readings[pad], pixel.value, onMark(pixel));
-    }
-    text += "] ";
-    text += stateText(timeMs);
-    return text;
+    return DecisionDump::touchStateDescription(decisionRecord(readings, 0, timeMs, nullptr, eventStats));
 }
 
-std::string Algs::virtualStateDescription(const Readings& /*readings*/, unsigned int timeMs) const
+std::string Algs::virtualStateDescription(const Readings& readings, unsigned int timeMs) const
 {
-    std::string text = handFeaturesText();
-    text += '[';
-    for (std::size_t group = 0; group < VirtualImage::kGroupCount; ++group) {
-        const VirtualPixel& pixel = virtualPixels.at(group);
-        if (group > 0) text += ", ";
-        appendFormat(text, "%s=%4d%s", pixel.name.c_str(), pixel.value, onMark(pixel));
-    }
-    text += "] ";
-    text += stateText(timeMs);
-    return text;
+    return DecisionDump::virtualStateDescription(decisionRecord(readings, 0, timeMs, nullptr, eventStats));
 }
 
 // The phase of the touch in this frame; the first row that holds decides.
@@ -292,32 +236,8 @@ std::pair<TouchPhase, std::int32_t> Algs::touchPhase(unsigned int timeMs) const
     return {TouchPhase::Idle, 0};
 }
 
-// One word for the phase of the touch in this frame, its time and region,
-// and at a release whether anything is still above noise.
-std::string Algs::stateText(unsigned int timeMs) const
-{
-    const auto [phase, ms] = touchPhase(timeMs);
-    const int region = static_cast<int>(handStats.activeRegion);
-    const char* noise = handStats.aboveNoise ? "ABOVENOISE" : "BELOWNOISE";
-
-    std::string text;
-    switch (phase) {
-    case TouchPhase::Idle: break;
-    case TouchPhase::StartTouch: appendFormat(text, "STARTTOUCH %dms ActiveRegion=%d", ms, region); break;
-    case TouchPhase::Holding: appendFormat(text, "HOLDING %dms ActiveRegion=%d", ms, region); break;
-    case TouchPhase::StartHold: appendFormat(text, "STARTHOLD %dms ActiveRegion=%d", ms, region); break;
-    case TouchPhase::SuppressHold: appendFormat(text, "SUPPRESSHOLD %dms ActiveRegion=%d", ms, region); break;
-    case TouchPhase::Touching: appendFormat(text, "TOUCHING %dms ActiveRegion=%d", ms, region); break;
-    case TouchPhase::EndHold: appendFormat(text, "ENDHOLD %dms ActiveRegion=%d %s", ms, region, noise); break;
-    case TouchPhase::Tap: appendFormat(text, "TAP %dms ActiveRegion=%d %s", ms, region, noise); break;
-    case TouchPhase::SuppressTap: appendFormat(text, "SUPPRESSTAP %dms ActiveRegion=%d %s", ms, region, noise); break;
-    case TouchPhase::EndTouch: appendFormat(text, "ENDTOUCH %dms ActiveRegion=%d %s", ms, region, noise); break;
-    }
-    return text;
-}
-
 DecisionRecord Algs::decisionRecord(const Readings& readings, unsigned int frameNumber, unsigned int timeMs,
-                                    const HidEventRef& event) const
+                                    const HidEventRef& event, const EventStats& countersBefore) const
 {
     const HandStats& hand = handStats;
     DecisionRecord record;
@@ -354,6 +274,8 @@ DecisionRecord Algs::decisionRecord(const Readings& readings, unsigned int frame
     record.tapAccepted = hand.tapAccepted;
     std::tie(record.phase, record.phaseMs) = touchPhase(timeMs);
     record.event = event;
+    record.countersBefore = countersBefore;
+    record.counters = eventStats;
     return record;
 }
 

@@ -76,14 +76,10 @@ private:
     void updateVirtualPixels();
     EventDecision decideEvent() const;
     void emitEvent(const VeltoHost::HidEventRef& event, unsigned int frameNumber, VeltoHost::HidEventList& events);
-    void writeDumps(const Readings& readings, unsigned int frameNumber, unsigned int timeMs) const;
-
     DecisionRecord decisionRecord(const Readings& readings, unsigned int frameNumber, unsigned int timeMs,
-                                  const VeltoHost::HidEventRef& event) const;
+                                  const VeltoHost::HidEventRef& event, const EventStats& countersBefore) const;
     // The phase word of this frame and the milliseconds printed with it.
     std::pair<TouchPhase, std::int32_t> touchPhase(unsigned int timeMs) const;
-    std::string stateText(unsigned int timeMs) const;
-    std::string handFeaturesText() const;
 };
 
 }  // namespace VeltoTouch

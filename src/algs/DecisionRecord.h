@@ -1,5 +1,6 @@
 #pragma once
 
+#include "algs/EventStats.h"
 #include "algs/PixelRegion.h"
 #include "algs/TouchPhase.h"
 #include "algs/VirtualImage.h"
@@ -58,8 +59,11 @@ struct DecisionRecord {
     TouchPhase phase = TouchPhase::Idle;
     std::int32_t phaseMs = 0;
 
-    // The event emitted in this frame, if any.
+    // The event emitted in this frame, if any, and the event counters before
+    // and after it: the counters this frame moved are those that differ.
     VeltoHost::HidEventRef event;
+    EventStats countersBefore;
+    EventStats counters;
 };
 
 }  // namespace VeltoTouch

@@ -25,6 +25,8 @@ int padIndexOfLetter(char letter) { return letter - 'A'; }
 
 }  // namespace
 
+std::string_view VirtualImage::groupName(std::size_t group) { return kGroupNames.at(group); }
+
 VirtualImage::VirtualImage()
 {
     groups.assign(kGroupNames.begin(), kGroupNames.end());

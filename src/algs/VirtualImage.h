@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace VeltoTouch {
@@ -18,6 +19,9 @@ public:
     static constexpr std::size_t kGroupCount = 23;
 
     VirtualImage();
+
+    // The letters of group `group`'s pads, "ABE" to "MNO".
+    static std::string_view groupName(std::size_t group);
 
     // Recomputes the group sums and strongest members from this frame's pads.
     void updateValues(const std::vector<Pixel>& pixels);
