@@ -75,7 +75,9 @@ void DecisionDumpWriter::frameDecided(const DecisionRecord& record)
         _out << VeltoTouch::JsonValue::dump(toJson(record), false) << '\n';
         return;
     }
-    for (const std::string& message : VeltoTouch::DecisionDump::messages(record)) _out << message << '\n';
+    for (std::size_t which = 0; which < VeltoTouch::DecisionDump::kMessageCount; ++which) {
+        _out << VeltoTouch::DecisionDump::message(which, record) << '\n';
+    }
 }
 
 Json DecisionDumpWriter::toJson(const DecisionRecord& record)

@@ -57,6 +57,29 @@ bool factorIndexFromKey(const std::string& key, std::size_t& index)
     return true;
 }
 
+// The event decision, row by row (see Algs::EventRule).
+using Hand = const HandStats&;
+HidEventRef noEvent(PixelRegion) { return nullptr; }
+constexpr std::array<Algs::EventRule, Algs::kEventRuleCount> kEventRules = {{
+    {"a touch begins", [](Hand h, std::uint16_t) { return h.touching && !h.wasTouching; },
+     &Algs::createMayBeginEvent, false},
+    {"a hold begins", [](Hand h, std::uint16_t) { return h.holding && !h.wasHolding; },
+     &Algs::createHoldStartEvent, false},
+    {"a hold moves to another region",
+     [](Hand h, std::uint16_t) { return h.holding && h.wasHolding && h.activeRegion != h.previousActiveRegion; },
+     &Algs::createHoldChangeEvent, false},
+    {"a hold ends", [](Hand h, std::uint16_t) { return h.wasHolding && !h.holding; }, &Algs::createHoldEndEvent,
+     true},
+    {"a tap is accepted", [](Hand h, std::uint16_t) { return h.tapAccepted; }, &Algs::createTapEvent, true},
+    {"a touch ends right after its may-begin",
+     [](Hand h, std::uint16_t lastPhase) {
+         return !h.touching && h.wasTouching && lastPhase == HidEvent::kPhaseMayBegin;
+     },
+     [](PixelRegion) { return Algs::createCancelEvent(); }, true},
+    {"a touch ends otherwise", [](Hand h, std::uint16_t) { return !h.touching && h.wasTouching; }, noEvent, true},
+    {"anything else", [](Hand, std::uint16_t) { return true; }, noEvent, false},
+}};
+
 }  // namespace
 
 Algs::Algs()
@@ -108,8 +131,8 @@ void Algs::processTouchFrame(const Readings& readings, unsigned int frameNumber,
     eventStats.update(handStats);
     const DecisionRecord record = decisionRecord(readings, frameNumber, timeMs, decision.event, countersBefore);
     if (decisionObserver) decisionObserver->frameDecided(record);
-    if (dumping) {
-        for (std::string& message : DecisionDump::messages(record)) log.write(LogLevel::Debug, std::move(message));
+    for (std::size_t which = 0; dumping && which < DecisionDump::kMessageCount; ++which) {
+        if (log.isEnabled(LogLevel::Debug)) log.write(LogLevel::Debug, DecisionDump::message(which, record));
     }
 }
 
@@ -132,25 +155,22 @@ void Algs::processTouchFrame(const Readings& readings, unsigned int frameNumber,
     }
 }
 
-// The first row that holds decides; every region is the touch's active region.
-Algs::EventDecision Algs::decideEvent() const
-{
-    const HandStats& hand = handStats;
-    const PixelRegion region = hand.activeRegion;
-    const bool touchBegins = hand.touching && !hand.wasTouching;
-    const bool touchEnds = !hand.touching && hand.wasTouching;
+const std::array<Algs::EventRule, Algs::kEventRuleCount>& Algs::eventRules() noexcept { return kEventRules; }
 
-    if (touchBegins) return {createMayBeginEvent(region), false};
-    if (hand.holding && !hand.wasHolding) return {createHoldStartEvent(region), false};
-    if (hand.holding && hand.wasHolding && hand.activeRegion != hand.previousActiveRegion) {
-        return {createHoldChangeEvent(region), false};
-    }
-    if (hand.wasHolding && !hand.holding) return {createHoldEndEvent(region), true};
-    if (hand.tapAccepted) return {createTapEvent(region), true};
-    if (touchEnds && lastEventPhase == HidEvent::kPhaseMayBegin) return {createCancelEvent(), true};
-    if (touchEnds) return {nullptr, true};
-    return {nullptr, false};
+// The rows are tried in order, unrolled over the constant table so that
+// every condition is inlined: this runs every frame.
+template <std::size_t... Row>
+Algs::EventDecision Algs::decideEvent(std::index_sequence<Row...>) const
+{
+    EventDecision decision;
+    static_cast<void>(((kEventRules[Row].holds(handStats, lastEventPhase) &&
+                        (decision = {kEventRules[Row].create(handStats.activeRegion), kEventRules[Row].resetsTouch},
+                         true)) ||
+                       ...));
+    return decision;
 }
+
+Algs::EventDecision Algs::decideEvent() const { return decideEvent(std::make_index_sequence<kEventRuleCount>()); }
 
 void Algs::emitEvent(const HidEventRef& event, unsigned int frameNumber, HidEventList& events)
 {

@@ -48,6 +48,19 @@ public:
     std::string touchStateDescription(const Readings& readings, unsigned int timeMs) const;
     std::string virtualStateDescription(const Readings& readings, unsigned int timeMs) const;
 
+    // One row of the event decision. Every frame the first row whose
+    // condition holds for the hand statistics (and the phase of the last
+    // event) decides: the event it creates, in the touch's active region, and
+    // whether the touch's statistics are reset.
+    struct EventRule {
+        const char* name;
+        bool (*holds)(const HandStats& hand, std::uint16_t lastEventPhase);
+        VeltoHost::HidEventRef (*create)(PixelRegion region);  // a null reference: no event
+        bool resetsTouch;
+    };
+    static constexpr std::size_t kEventRuleCount = 8;
+    static const std::array<EventRule, kEventRuleCount>& eventRules() noexcept;
+
     static VeltoHost::HidEventRef createMayBeginEvent(PixelRegion region);
     static VeltoHost::HidEventRef createHoldStartEvent(PixelRegion region);
     static VeltoHost::HidEventRef createHoldChangeEvent(PixelRegion region);
@@ -75,6 +88,8 @@ private:
     void updatePixels(const Readings& readings);
     void updateVirtualPixels();
     EventDecision decideEvent() const;
+    template <std::size_t... Row>
+    EventDecision decideEvent(std::index_sequence<Row...>) const;
     void emitEvent(const VeltoHost::HidEventRef& event, unsigned int frameNumber, VeltoHost::HidEventList& events);
     DecisionRecord decisionRecord(const Readings& readings, unsigned int frameNumber, unsigned int timeMs,
                                   const VeltoHost::HidEventRef& event, const EventStats& countersBefore) const;

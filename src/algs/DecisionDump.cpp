@@ -67,16 +67,21 @@ std::string stateText(const DecisionRecord& record)
 
 }  // namespace
 
-std::array<std::string, DecisionDump::kMessageCount> DecisionDump::messages(const DecisionRecord& record)
+std::string DecisionDump::message(std::size_t which, const DecisionRecord& record)
 {
     const unsigned int frame = record.frameNumber;
     const unsigned int time = record.timeMs;
-    return {VeltoHost::formatLog("Frame %u @%ums, *** Event Stats ***\n%@", frame, time,
-                                 record.counters.statsDictionary()),
-            VeltoHost::formatLog("Frame %u @%ums, *** Touch State Description ***\n%@", frame, time,
-                                 touchStateDescription(record)),
-            VeltoHost::formatLog("Frame %u @%ums, *** Virtual State Description ***\n%@", frame, time,
-                                 virtualStateDescription(record))};
+    switch (which) {
+    case 0:
+        return VeltoHost::formatLog("Frame %u @%ums, *** Event Stats ***\n%@", frame, time,
+                                    record.counters.statsDictionary());
+    case 1:
+        return VeltoHost::formatLog("Frame %u @%ums, *** Touch State Description ***\n%@", frame, time,
+                                    touchStateDescription(record));
+    default:
+        return VeltoHost::formatLog("Frame %u @%ums, *** Virtual State Description ***\n%@", frame, time,
+                                    virtualStateDescription(record));
+    }
 }
 
 std::string DecisionDump::touchStateDescription(const DecisionRecord& record)

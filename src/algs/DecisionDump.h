@@ -2,7 +2,7 @@
 
 #include "algs/DecisionRecord.h"
 
-#include <array>
+#include <cstddef>
 #include <string>
 
 namespace VeltoTouch {
@@ -15,8 +15,9 @@ class DecisionDump {
 public:
     static constexpr std::size_t kMessageCount = 3;
 
-    // "Frame N @Tms, *** Event Stats ***\n..." and its two followers.
-    static std::array<std::string, kMessageCount> messages(const DecisionRecord& record);
+    // Message 0, 1 or 2 of the frame: "Frame N @Tms, *** Event Stats ***\n...",
+    // then the touch and the virtual state descriptions.
+    static std::string message(std::size_t which, const DecisionRecord& record);
     static std::string touchStateDescription(const DecisionRecord& record);
     static std::string virtualStateDescription(const DecisionRecord& record);
 };
