@@ -64,13 +64,6 @@ std::string ToolFiles::read(const std::string& path)
     return readText(path);
 }
 
-void ToolFiles::write(const std::string& path, const std::string& text)
-{
-    std::ofstream out = create(path);
-    out << text;
-    close(out, path);
-}
-
 std::ofstream ToolFiles::create(const std::string& path)
 {
     if (isDirectory(path)) throw ToolError(path + ": is a directory");

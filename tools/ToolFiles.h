@@ -19,7 +19,6 @@ class ToolFiles {
 public:
     // The whole file; a directory is refused rather than read as empty text.
     static std::string read(const std::string& path);
-    static void write(const std::string& path, const std::string& text);
 
     // Opens `path` for writing, emptying it, so that a bad output path fails
     // before any work is done.

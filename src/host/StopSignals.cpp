@@ -33,6 +33,4 @@ StopSignals::~StopSignals()
 
 bool StopSignals::requested() noexcept { return gStopSignal.load(std::memory_order_relaxed) != 0; }
 
-int StopSignals::signalNumber() noexcept { return gStopSignal.load(std::memory_order_relaxed); }
-
 }  // namespace VeltoHost

@@ -22,8 +22,6 @@ public:
 
     // True once SIGINT or SIGTERM arrived while installed.
     static bool requested() noexcept;
-    // Which signal it was (0 when none).
-    static int signalNumber() noexcept;
 
 private:
     struct sigaction _previousInt {};
