@@ -130,10 +130,18 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
         ->capture_default_str();
     replayCommand->add_option("--set", replaySets, "KEY=VALUE: pipeline state before the first frame (VALUE is JSON)")
         ->check(settingCheck());
-    replayCommand->add_option("--get", replay.reads, "KEY: pipeline state to print after the last frame");
-    replayCommand->add_flag("--dump", replay.dump,
+    auto* replayGet =
+        replayCommand->add_option("--get", replay.reads, "KEY: pipeline state to print after the last frame");
+    auto* replayDump = replayCommand->add_flag("--dump", replay.dump,
                             "Print the recogniser's per-frame descriptions (with --jsonl: its record of each frame)");
-    replayCommand->add_flag("--jsonl", replay.jsonLines, "One JSON object per line");
+    auto* replayJson = replayCommand->add_flag("--jsonl", replay.jsonLines, "One JSON object per line");
+    replayCommand
+        ->add_option("--check", replay.check,
+                     "EXPECTED: compare the events (and the values it holds) with this file of --jsonl lines; "
+                     "exit 1 at the first difference")
+        ->excludes(replayJson)
+        ->excludes(replayDump)
+        ->excludes(replayGet);
 
     SynthCommand::Options synth;
     auto* synthCommand = app.add_subcommand("synth", "Write a recording made from a gesture script");
@@ -299,7 +307,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     try {
         if (*replayCommand) {
             replay.settings = splitAll(replaySets);
-            ReplayCommand::run(replay, out, err);
+            return ReplayCommand::run(replay, out, err);
         } else if (*synthCommand) {
             SynthCommand::run(synth);
         } else if (*evalCommand) {

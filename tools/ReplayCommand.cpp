@@ -2,10 +2,12 @@
 
 #include "DecisionDumpWriter.h"
 #include "EventFormatter.h"
+#include "ReplayCheck.h"
 #include "StateArguments.h"
 #include "ToolFiles.h"
 #include "pipeline/Pipeline.h"
 #include "platform/MonotonicClock.h"
+#include "recording/JsonValue.h"
 #include "recording/PipelineRecording.h"
 
 #include <functional>
@@ -17,13 +19,17 @@ namespace VeltoTool {
 using VeltoTouch::Pipeline;
 using VeltoTouch::PipelineRecording;
 
-void ReplayCommand::run(const Options& options, std::ostream& out, std::ostream& err)
+int ReplayCommand::run(const Options& options, std::ostream& out, std::ostream& err)
 {
+    // A faulty expected file is refused before anything is played.
+    std::optional<ReplayCheck> check;
+    if (!options.check.empty()) check = ReplayCheck::read(options.check);
+
     auto pipeline = std::make_shared<Pipeline>();
     StateArguments::apply(*pipeline, options.settings, err);
 
     // The first time the playback sets is its start; readable lines count from there.
-    EventFormatter formatter(options.jsonLines);
+    EventFormatter formatter(options.jsonLines || check);
     std::optional<std::uint64_t> origin;
     pipeline->setTimeProbe = [&](std::uint64_t time) {
         if (!origin) {
@@ -32,7 +38,13 @@ void ReplayCommand::run(const Options& options, std::ostream& out, std::ostream&
         }
     };
     pipeline->hidEventsProbe = [&](const VeltoHost::HidEventList& events) {
-        for (const auto& event : events) out << formatter.format(*event) << '\n';
+        for (const auto& event : events) {
+            if (check) {
+                check->event(nlohmann::ordered_json::parse(formatter.format(*event)));
+            } else {
+                out << formatter.format(*event) << '\n';
+            }
+        }
     };
 
     DecisionDumpWriter dumps(out, options.jsonLines ? DecisionDumpWriter::Format::JsonLines
@@ -64,9 +76,24 @@ void ReplayCommand::run(const Options& options, std::ostream& out, std::ostream&
     });
     pipeline->setDecisionObserver(nullptr);
 
-    for (const std::string& key : options.reads) {
-        out << formatter.formatState(key, pipeline->getState(key)) << '\n';
+    if (!check) {
+        for (const std::string& key : options.reads) {
+            out << formatter.formatState(key, pipeline->getState(key)) << '\n';
+        }
+        return 0;
     }
+    for (const std::string& key : check->keys()) {
+        // Read back as the expected file was written: through its JSON text.
+        const std::string text = VeltoTouch::JsonValue::dump(VeltoTouch::JsonValue::toJson(pipeline->getState(key)), false);
+        check->value(key, nlohmann::ordered_json::parse(text));
+    }
+    check->finish();
+    if (const auto& difference = check->firstDifference()) {
+        err << "veltotouch: " << options.file << ": " << *difference << '\n';
+        return 1;
+    }
+    out << options.file << ": " << check->summary() << '\n';
+    return 0;
 }
 
 }  // namespace VeltoTool

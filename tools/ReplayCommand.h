@@ -27,11 +27,15 @@ public:
         bool dump = false;
         // Every line of `out` is then one JSON object, dumps included.
         bool jsonLines = false;
+        // A file of expected events and values (as --jsonl prints them) to
+        // compare the replay with, instead of printing it.
+        std::string check;
     };
 
     // Writes events, dumps and reads to `out`; warnings and notes to `err`.
-    // Throws ToolError or the recording's own errors.
-    static void run(const Options& options, std::ostream& out, std::ostream& err);
+    // With a check, one line: the verdict to `out`, or the first difference
+    // to `err` and exit status 1. Throws ToolError or the recording's own errors.
+    static int run(const Options& options, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool
