@@ -3,6 +3,7 @@
 #include "CtlCommand.h"
 #include "DaemonCommand.h"
 #include "DumpCommand.h"
+#include "PropertiesCommand.h"
 #include "EvalCommand.h"
 #include "FiniteNumberCheck.h"
 #include "HostCommand.h"
@@ -130,18 +131,13 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
         ->capture_default_str();
     replayCommand->add_option("--set", replaySets, "KEY=VALUE: pipeline state before the first frame (VALUE is JSON)")
         ->check(settingCheck());
-    auto* replayGet =
-        replayCommand->add_option("--get", replay.reads, "KEY: pipeline state to print after the last frame");
-    auto* replayDump = replayCommand->add_flag("--dump", replay.dump,
+    replayCommand->add_option("--get", replay.reads, "KEY: pipeline state to print after the last frame");
+    replayCommand->add_flag("--dump", replay.dump,
                             "Print the recogniser's per-frame descriptions (with --jsonl: its record of each frame)");
-    auto* replayJson = replayCommand->add_flag("--jsonl", replay.jsonLines, "One JSON object per line");
-    replayCommand
-        ->add_option("--check", replay.check,
-                     "EXPECTED: compare the events (and the values it holds) with this file of --jsonl lines; "
-                     "exit 1 at the first difference")
-        ->excludes(replayJson)
-        ->excludes(replayDump)
-        ->excludes(replayGet);
+    replayCommand->add_flag("--jsonl", replay.jsonLines, "One JSON object per line");
+    replayCommand->add_option("--check", replay.check,
+                              "EXPECTED: compare the events (and the values it holds) with this file of --jsonl "
+                              "lines instead of printing them; exit 1 at the first difference");
 
     SynthCommand::Options synth;
     auto* synthCommand = app.add_subcommand("synth", "Write a recording made from a gesture script");
@@ -230,6 +226,11 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     daemonCommand->add_option("--plugin", daemon.plugin,
                               "Plug-in module to load (default: $VELTOTOUCH_PLUGIN, else the installed or built module)");
 
+    PropertiesCommand::Options properties;
+    auto* propertiesCommand =
+        app.add_subcommand("properties", "List every property of the plug-in: type, access, default and meaning");
+    propertiesCommand->add_flag("--markdown", properties.markdown, "As a Markdown document (docs/properties.md)");
+
     CtlCommand::Options ctl;
     auto* ctlCommand = app.add_subcommand("ctl", "Ask the running daemon: devices, properties, gestures, recordings");
     ctlCommand->add_option("--bus", ctl.bus, "system, session or a D-Bus address")->capture_default_str();
@@ -304,6 +305,14 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
         return 0;
     }
 
+    // Said here rather than with CLI11's excludes, whose help lists the
+    // excluded options in no fixed order.
+    if (*replayCommand && !replay.check.empty() && (replay.jsonLines || replay.dump || !replay.reads.empty())) {
+        err << "veltotouch: --check compares instead of printing: it takes no --jsonl, --dump or --get (see "
+               "'veltotouch help replay')\n";
+        return kUsageError;
+    }
+
     try {
         if (*replayCommand) {
             replay.settings = splitAll(replaySets);
@@ -315,6 +324,8 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             return EvalCommand::run(eval, out, err);
         } else if (*dumpCommand) {
             DumpCommand::run(dump, out);
+        } else if (*propertiesCommand) {
+            PropertiesCommand::run(properties, out);
         } else if (*reportCommand) {
             report.settings = splitAll(reportSets);
             ReportCommand::run(report, err);

@@ -57,6 +57,47 @@ bool factorIndexFromKey(const std::string& key, std::size_t& index)
     return true;
 }
 
+// The recogniser's state keys (see Algs::StateKey).
+using AlgsRef = const Algs&;
+constexpr std::array<Algs::StateKey, Algs::kStateKeyCount> kStateKeys = {{
+    {"EnableHoldSuppression", "boolean", "a long touch holds only with enough touch score; a non-zero number is true",
+     [](AlgsRef a, std::size_t) { return PropertyValue::boolean(a.handStats.enableHoldSuppression); },
+     [](Algs& a, std::size_t, const PropertyValue& v) { a.handStats.enableHoldSuppression = v.toBool(); }},
+    {"EnableTapSuppression", "boolean", "a release is a tap only if the tap-rejection features accept it",
+     [](AlgsRef a, std::size_t) { return PropertyValue::boolean(a.handStats.enableTapSuppression); },
+     [](Algs& a, std::size_t, const PropertyValue& v) { a.handStats.enableTapSuppression = v.toBool(); }},
+    {"HoldTimeoutMilliseconds", "uint32", "touch time after which a touch may become a hold (low 32 bits kept)",
+     [](AlgsRef a, std::size_t) { return PropertyValue::uint32(a.handStats.holdTimeoutMs); },
+     [](Algs& a, std::size_t, const PropertyValue& v) {
+         a.handStats.holdTimeoutMs = static_cast<std::uint32_t>(v.toUInt64());
+     }},
+    {"ActivationThreshold", "float32", "level at which a pad or group turns active (the divisor of its ratio)",
+     [](AlgsRef a, std::size_t) { return PropertyValue::float32(a.handStats.activationThreshold); },
+     [](Algs& a, std::size_t, const PropertyValue& v) { a.handStats.activationThreshold = v.toFloat(); }},
+    {"VirtualNormalizationFactors.N", "float32",
+     "factor N (0 to 22) of the group table; null beyond it. The groups keep the gains they were built with",
+     [](AlgsRef a, std::size_t n) {
+         const auto& factors = a.virtualImage.normalizationFactors;
+         return n < factors.size() ? PropertyValue::float32(factors[n]) : PropertyValue::null();
+     },
+     [](Algs& a, std::size_t n, const PropertyValue& v) {
+         auto& factors = a.virtualImage.normalizationFactors;
+         if (n < factors.size()) factors[n] = v.toFloat();
+     },
+     true},
+    {"EventStats", "dictionary", "gesture counters, Dispatched and Rejected, by kind and region",
+     [](AlgsRef a, std::size_t) { return a.eventStats.statsDictionary(); }, nullptr},
+    {"ResetEventStats", "action", "setting it, to any value, zeroes every counter; reads as null", nullptr,
+     [](Algs& a, std::size_t, const PropertyValue&) { a.eventStats.Reset(); }},
+    {"DebugInfo", "dictionary", "the counters again, under the key EventStats",
+     [](AlgsRef a, std::size_t) {
+         VeltoHost::PropertyDictionary info;
+         info.set("EventStats", a.eventStats.statsDictionary());
+         return PropertyValue::dictionary(std::move(info));
+     },
+     nullptr},
+}};
+
 // The event decision, row by row (see Algs::EventRule).
 using Hand = const HandStats&;
 HidEventRef noEvent(PixelRegion) { return nullptr; }
@@ -188,43 +229,29 @@ void Algs::Reset()
 
 PropertyValue Algs::getState(const std::string& key)
 {
-    if (key == "EnableHoldSuppression") return PropertyValue::boolean(handStats.enableHoldSuppression);
-    if (key == "EnableTapSuppression") return PropertyValue::boolean(handStats.enableTapSuppression);
-    if (key == "HoldTimeoutMilliseconds") return PropertyValue::uint32(handStats.holdTimeoutMs);
-    if (key == "ActivationThreshold") return PropertyValue::float32(handStats.activationThreshold);
-    if (std::size_t index = 0; factorIndexFromKey(key, index)) {
-        if (index >= virtualImage.normalizationFactors.size()) return PropertyValue::null();
-        return PropertyValue::float32(virtualImage.normalizationFactors[index]);
-    }
-    if (key == "EventStats") return eventStats.statsDictionary();
-    if (key == "DebugInfo") {
-        VeltoHost::PropertyDictionary info;
-        info.set("EventStats", eventStats.statsDictionary());
-        return PropertyValue::dictionary(std::move(info));
-    }
-    return PropertyValue::null();
+    std::size_t index = 0;
+    const StateKey* entry = stateKeyFor(key, index);
+    if (!entry || !entry->get) return PropertyValue::null();
+    return entry->get(*this, index);
 }
 
 void Algs::setState(const std::string& key, PropertyValue value)
 {
-    // Values that are not numbers count as 0 and nothing is range-checked:
-    // the host is trusted to tune within reason.
-    if (key == "EnableHoldSuppression") {
-        handStats.enableHoldSuppression = value.toBool();
-    } else if (key == "EnableTapSuppression") {
-        handStats.enableTapSuppression = value.toBool();
-    } else if (key == "HoldTimeoutMilliseconds") {
-        handStats.holdTimeoutMs = static_cast<std::uint32_t>(value.toUInt64());
-    } else if (key == "ActivationThreshold") {
-        handStats.activationThreshold = value.toFloat();
-    } else if (key == "ResetEventStats") {
-        eventStats.Reset();
-    } else if (std::size_t index = 0; factorIndexFromKey(key, index)) {
-        // Only the table changes: the virtual pixels keep the gains they were
-        // built with.
-        if (index < virtualImage.normalizationFactors.size()) virtualImage.normalizationFactors[index] = value.toFloat();
-    }
+    std::size_t index = 0;
+    const StateKey* entry = stateKeyFor(key, index);
+    if (entry && entry->set) entry->set(*this, index, value);
 }
+
+const Algs::StateKey* Algs::stateKeyFor(const std::string& key, std::size_t& index)
+{
+    for (const StateKey& entry : kStateKeys) {
+        if (!entry.indexed && key == entry.name) return &entry;
+        if (entry.indexed && factorIndexFromKey(key, index)) return &entry;
+    }
+    return nullptr;
+}
+
+const std::array<Algs::StateKey, Algs::kStateKeyCount>& Algs::stateKeys() noexcept { return kStateKeys; }
 
 std::string Algs::touchStateDescription(const Readings& readings, unsigned int timeMs) const
 {

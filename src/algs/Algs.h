@@ -45,6 +45,24 @@ public:
     PropertyValue getState(const std::string& key);
     void setState(const std::string& key, PropertyValue value);
 
+    // One state key of the recogniser, declared once: getState, setState and
+    // the listing of every key (veltotouch properties) all read this table.
+    // An indexed key is a family: its name ends in ".N" and the key's index
+    // picks one entry. Values that are not numbers count as 0 when set, and
+    // nothing is range-checked: the host is trusted to tune within reason.
+    struct StateKey {
+        const char* name;
+        const char* type;
+        const char* meaning;
+        // nullptr: reads as null (an action).
+        PropertyValue (*get)(const Algs& algs, std::size_t index);
+        // nullptr: read-only, setting it does nothing.
+        void (*set)(Algs& algs, std::size_t index, const PropertyValue& value);
+        bool indexed = false;
+    };
+    static constexpr std::size_t kStateKeyCount = 8;
+    static const std::array<StateKey, kStateKeyCount>& stateKeys() noexcept;
+
     std::string touchStateDescription(const Readings& readings, unsigned int timeMs) const;
     std::string virtualStateDescription(const Readings& readings, unsigned int timeMs) const;
 
@@ -88,6 +106,8 @@ private:
     void updatePixels(const Readings& readings);
     void updateVirtualPixels();
     EventDecision decideEvent() const;
+    // The entry of `key` and, for an indexed one, the key's index.
+    static const StateKey* stateKeyFor(const std::string& key, std::size_t& index);
     template <std::size_t... Row>
     EventDecision decideEvent(std::index_sequence<Row...>) const;
     void emitEvent(const VeltoHost::HidEventRef& event, unsigned int frameNumber, VeltoHost::HidEventList& events);

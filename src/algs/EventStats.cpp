@@ -2,6 +2,8 @@
 
 #include "platform/PropertyDictionary.h"
 
+#include <string_view>
+
 namespace VeltoTouch {
 
 using VeltoHost::PropertyDictionary;
@@ -74,39 +76,53 @@ void EventStats::updateHold(const HandStats& h)
     }
 }
 
+const std::array<EventStats::Counter, EventStats::kCounterCount>& EventStats::counters() noexcept
+{
+    static constexpr const char* kDispatched = "Dispatched";
+    static constexpr const char* kRejected = "Rejected";
+    static constexpr std::array<Counter, kCounterCount> kCounters = {{
+        {kDispatched, "numTaps", &EventStats::numTaps},
+        {kDispatched, "numBeginHold", &EventStats::numBeginHold},
+        {kDispatched, "numIncrementHold", &EventStats::numIncrementHold},
+        {kDispatched, "numEndHold", &EventStats::numEndHold},
+        {kDispatched, "numHolding2Suppressed", &EventStats::numHolding2Suppressed},
+        {kDispatched, "numVolumeUp", &EventStats::numVolumeUp},
+        {kDispatched, "numVolumeIncrement", &EventStats::numVolumeIncrement},
+        {kDispatched, "numVolumeDown", &EventStats::numVolumeDown},
+        {kDispatched, "numVolumeDecrement", &EventStats::numVolumeDecrement},
+        {kDispatched, "numPlayPause", &EventStats::numPlayPause},
+        {kDispatched, "numOvriCall", &EventStats::numOvriCall},
+        {kDispatched, "numOvriCallIncrement", &EventStats::numOvriCallIncrement},
+        {kRejected, "numRejectedTap", &EventStats::numRejectedTap},
+        {kRejected, "numRejectedBeginHold", &EventStats::numRejectedBeginHold},
+        {kRejected, "numRejectedIncrementHold", &EventStats::numRejectedIncrementHold},
+        {kRejected, "numRejectedEndHold", &EventStats::numRejectedEndHold},
+        {kRejected, "numSuppressed2Holding", &EventStats::numSuppressed2Holding},
+        {kRejected, "numRejectedVolumeUp", &EventStats::numRejectedVolumeUp},
+        {kRejected, "numRejectedVolumeIncrement", &EventStats::numRejectedVolumeIncrement},
+        {kRejected, "numRejectedVolumeDown", &EventStats::numRejectedVolumeDown},
+        {kRejected, "numRejectedVolumeDecrement", &EventStats::numRejectedVolumeDecrement},
+        {kRejected, "numRejectedPlayPause", &EventStats::numRejectedPlayPause},
+        {kRejected, "numRejectedOvriCall", &EventStats::numRejectedOvriCall},
+        {kRejected, "numRejectedOvriCallIncrement", &EventStats::numRejectedOvriCallIncrement},
+    }};
+    return kCounters;
+}
+
 PropertyValue EventStats::statsDictionary() const
 {
-    PropertyDictionary dispatched;
-    dispatched.set("numTaps", PropertyValue::uint64(numTaps));
-    dispatched.set("numBeginHold", PropertyValue::uint64(numBeginHold));
-    dispatched.set("numIncrementHold", PropertyValue::uint64(numIncrementHold));
-    dispatched.set("numEndHold", PropertyValue::uint64(numEndHold));
-    dispatched.set("numHolding2Suppressed", PropertyValue::uint64(numHolding2Suppressed));
-    dispatched.set("numVolumeUp", PropertyValue::uint64(numVolumeUp));
-    dispatched.set("numVolumeIncrement", PropertyValue::uint64(numVolumeIncrement));
-    dispatched.set("numVolumeDown", PropertyValue::uint64(numVolumeDown));
-    dispatched.set("numVolumeDecrement", PropertyValue::uint64(numVolumeDecrement));
-    dispatched.set("numPlayPause", PropertyValue::uint64(numPlayPause));
-    dispatched.set("numOvriCall", PropertyValue::uint64(numOvriCall));
-    dispatched.set("numOvriCallIncrement", PropertyValue::uint64(numOvriCallIncrement));
-
-    PropertyDictionary rejected;
-    rejected.set("numRejectedTap", PropertyValue::uint64(numRejectedTap));
-    rejected.set("numRejectedBeginHold", PropertyValue::uint64(numRejectedBeginHold));
-    rejected.set("numRejectedIncrementHold", PropertyValue::uint64(numRejectedIncrementHold));
-    rejected.set("numRejectedEndHold", PropertyValue::uint64(numRejectedEndHold));
-    rejected.set("numSuppressed2Holding", PropertyValue::uint64(numSuppressed2Holding));
-    rejected.set("numRejectedVolumeUp", PropertyValue::uint64(numRejectedVolumeUp));
-    rejected.set("numRejectedVolumeIncrement", PropertyValue::uint64(numRejectedVolumeIncrement));
-    rejected.set("numRejectedVolumeDown", PropertyValue::uint64(numRejectedVolumeDown));
-    rejected.set("numRejectedVolumeDecrement", PropertyValue::uint64(numRejectedVolumeDecrement));
-    rejected.set("numRejectedPlayPause", PropertyValue::uint64(numRejectedPlayPause));
-    rejected.set("numRejectedOvriCall", PropertyValue::uint64(numRejectedOvriCall));
-    rejected.set("numRejectedOvriCallIncrement", PropertyValue::uint64(numRejectedOvriCallIncrement));
-
     PropertyDictionary stats;
-    stats.set("Dispatched", PropertyValue::dictionary(std::move(dispatched)));
-    stats.set("Rejected", PropertyValue::dictionary(std::move(rejected)));
+    PropertyDictionary group;
+    const char* groupName = nullptr;
+    for (const Counter& counter : counters()) {
+        if (groupName && std::string_view(groupName) != counter.group) {
+            stats.set(groupName, PropertyValue::dictionary(std::move(group)));
+            group = PropertyDictionary();
+        }
+        groupName = counter.group;
+        group.set(counter.name, PropertyValue::uint64(this->*counter.member));
+    }
+    if (groupName) stats.set(groupName, PropertyValue::dictionary(std::move(group)));
     return PropertyValue::dictionary(std::move(stats));
 }
 

@@ -3,6 +3,8 @@
 #include "algs/HandStats.h"
 #include "platform/PropertyValue.h"
 
+#include <array>
+#include <cstddef>
 #include <cstdint>
 
 namespace VeltoTouch {
@@ -17,7 +19,17 @@ public:
     void Reset() noexcept { *this = EventStats(); }
     // Adds the outcome of the frame that the hand statistics just described.
     void update(const HandStats& handStats);
+    // {"Dispatched": {...}, "Rejected": {...}}, from the counter table.
     VeltoHost::PropertyValue statsDictionary() const;
+
+    // Every counter, declared once, in the order of the dictionary.
+    struct Counter {
+        const char* group;
+        const char* name;
+        std::uint64_t EventStats::*member;
+    };
+    static constexpr std::size_t kCounterCount = 24;
+    static const std::array<Counter, kCounterCount>& counters() noexcept;
 
     std::uint64_t numTaps = 0;
     std::uint64_t numBeginHold = 0;

@@ -20,15 +20,15 @@ void Pipeline::setState(const std::string& key, PropertyValue value)
     std::string algsKey = key;
     // The pipeline has no writable keys of its own; anything outside the
     // recogniser's domain is ignored.
-    if (Util::stripDomainFromKey(algsKey, "Algs")) _algs.setState(algsKey, std::move(value));
+    if (Util::stripDomainFromKey(algsKey, kAlgsDomain)) _algs.setState(algsKey, std::move(value));
 }
 
 PropertyValue Pipeline::getState(const std::string& key)
 {
     if (getStateProbe) getStateProbe(key);
     std::string algsKey = key;
-    if (Util::stripDomainFromKey(algsKey, "Algs")) return _algs.getState(algsKey);
-    if (key == "DebugInfo") {
+    if (Util::stripDomainFromKey(algsKey, kAlgsDomain)) return _algs.getState(algsKey);
+    if (key == kDebugInfoKey) {
         VeltoHost::PropertyDictionary info;
         info.set("ResetCount", PropertyValue::uint32(_resetCount));
         info.set("DisjointImageCount", PropertyValue::uint32(_disjointImageCount));

@@ -20,6 +20,11 @@ namespace VeltoTouch {
 // Probes run synchronously on the caller's thread; an empty probe is skipped.
 class Pipeline final : public PipelineInput, public PipelineOutput {
 public:
+    // The pipeline's own state key, beside the recogniser's under "Algs.":
+    // a dictionary of ResetCount and DisjointImageCount.
+    static constexpr const char* kDebugInfoKey = "DebugInfo";
+    static constexpr const char* kAlgsDomain = "Algs";
+
     std::function<void(std::uint64_t time)> setTimeProbe;
     std::function<void(const std::string& key, const PropertyValue& value)> setStateProbe;
     std::function<void(const std::uint8_t* data, std::size_t length)> inputReportProbe;

@@ -1,5 +1,7 @@
 #include "service/VeltoTouchHIDService.h"
 
+#include "service/ServicePropertyKey.h"
+
 #include "pipeline/FeatureReport.h"
 #include "pipeline/InputReport.h"
 #include "pipeline/Util.h"
@@ -304,7 +306,7 @@ PropertyValue VeltoTouchHIDService::getPropertyForKey(const char* key)
     _log.debug("getPropertyForKey:%@", key);
     if (!key) return {};
     std::string name = key;
-    if (Util::stripDomainFromKey(name, "Pipeline")) return copyPipelineState(name);
+    if (Util::stripDomainFromKey(name, kPipelineDomain)) return copyPipelineState(name);
     if (name == "Version") {
         static const PropertyValue version = PropertyValue::array({PropertyValue::int32(kServicePluginVersion[0]),
                                                                    PropertyValue::int32(kServicePluginVersion[1]),
@@ -327,7 +329,7 @@ bool VeltoTouchHIDService::setProperty(const PropertyValue& value, const char* k
     _log.debug("setProperty:%@ forKey:%@", value, key);
     if (!key) return false;
     std::string name = key;
-    if (Util::stripDomainFromKey(name, "Pipeline")) {
+    if (Util::stripDomainFromKey(name, kPipelineDomain)) {
         std::lock_guard<std::mutex> lock(_pipelineLock);
         _recording.setState(name, value);
         return true;

@@ -4,6 +4,10 @@
 
 #include <gtest/gtest.h>
 
+#include <cctype>
+#include <map>
+#include <string>
+
 namespace VeltoTouch::Test {
 namespace {
 
@@ -31,6 +35,41 @@ TEST(AlgsState, NormalizationFactorsByIndex)
     harness.setState(domain + ".99", PropertyValue::float64(0.5));
     harness.setState(domain, PropertyValue::float64(0.5));
     EXPECT_EQ(get(harness, domain + ".0"), PropertyValue::float32(0.6667f));
+}
+
+// Every key of the table is reached by its name only (an indexed one with
+// its index), reads as its entry says, and a write reaches exactly the value
+// that reads back; a value that is not a number is written as 0.
+TEST(AlgsState, EveryKeyOfTheTableReadsAndWritesItsOwnValue)
+{
+    for (const Algs::StateKey& key : Algs::stateKeys()) {
+        SCOPED_TRACE(key.name);
+        std::string name = key.name;
+        if (key.indexed) name.replace(name.rfind(".N"), 2, ".7");
+        PipelineHarness harness;
+        std::map<std::string, PropertyValue> before;
+        for (const Algs::StateKey& other : Algs::stateKeys()) before[other.name] = get(harness, other.name);
+
+        EXPECT_EQ(get(harness, name).isNull(), key.get == nullptr);
+        std::string lower = name;
+        for (char& c : lower) c = static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
+        EXPECT_TRUE(get(harness, lower).isNull());
+
+        harness.setState(name, PropertyValue::string("300"));
+        const PropertyValue written = get(harness, name);
+        if (key.set && key.get) {
+            EXPECT_EQ(written.toFloat(), 0.0f) << "a string counts as 0";
+            harness.setState(name, PropertyValue::float64(7.0));
+            EXPECT_EQ(get(harness, name).toFloat(), std::string(key.type) == "boolean" ? 1.0f : 7.0f);
+        } else if (key.get) {
+            EXPECT_EQ(written, before[key.name]) << "read-only";
+        }
+        for (const Algs::StateKey& other : Algs::stateKeys()) {
+            if (&other != &key && !other.indexed && std::string(other.type) != "dictionary") {
+                EXPECT_EQ(get(harness, other.name), before[other.name]) << "moved by " << name << ": " << other.name;
+            }
+        }
+    }
 }
 
 // Taps and holds counted by kind and by region; suppressed gestures are

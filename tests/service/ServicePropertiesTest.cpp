@@ -6,6 +6,7 @@
 #include "platform/SimulatedHostDevice.h"
 #include "recording/PipelineRecording.h"
 #include "service/ServiceHarness.h"
+#include "service/ServicePropertyKey.h"
 
 #include <gtest/gtest.h>
 
@@ -156,6 +157,13 @@ TEST(ServiceProperties, KeysAreRoutedByDomainAndName)
     EXPECT_EQ(after, before);
     device->refusePropertyWrites(true);
     EXPECT_FALSE(harness.setProperty("Version", PropertyValue::int32(1)));
+
+    // Every key of the service's table is its own, not the device's: the
+    // device's values of the same names never come back.
+    for (const VeltoTouch::ServicePropertyKey& key : VeltoTouch::kServicePropertyKeys) {
+        device->setProperty(key.name, PropertyValue::string("device's own"));
+        EXPECT_NE(harness.copyProperty(key.name), PropertyValue::string("device's own")) << key.name;
+    }
 
     // The firmware reports: hex text for what the device has, the failure
     // text for the rest.

@@ -22,7 +22,7 @@ TEST(Cli, UsageErrorsExitWithTwoAndOneLineThatNamesTheProblem)
     };
     const Case cases[] = {
         {{}, "A subcommand is required (see 'veltotouch help')"},
-        {{"frobnicate"}, "no command \"frobnicate\" (replay, synth, eval, dump, host, daemon, ctl, report, help)"},
+        {{"frobnicate"}, "no command \"frobnicate\" (replay, synth, eval, dump, host, daemon, properties, ctl, report, help)"},
         {{"replay"}, "FILE is required"},
         {{"synth", "tap top"}, "--output is required"},
         {{"replay", kTaps, "--speed", "nan"}, "--speed: expected a finite number, got nan (see 'veltotouch help replay')"},
@@ -48,6 +48,7 @@ TEST(Cli, UsageErrorsExitWithTwoAndOneLineThatNamesTheProblem)
         {{"ctl", "set", "NoEquals"}, "expected KEY=VALUE, got \"NoEquals\""},
         {{"ctl", "get", "-d", "first", "Pipeline.Algs.EventStats"}, "-d"},
         {{"help", "frobnicate"}, "help: no command \"frobnicate\""},
+        {{"replay", kTaps, "--check", kTaps, "--get", "DebugInfo"}, "--check compares instead of printing"},
     };
     for (const Case& c : cases) {
         std::string shown;

@@ -99,3 +99,12 @@ TEST(Tool, JsonLinesCarryTheEventFieldsAndStateReads)
     EXPECT_EQ(lines.back()["key"], "DebugInfo");
     EXPECT_EQ(lines.back()["value"]["ResetCount"], 1);
 }
+
+TEST(Tool, PropertiesDocumentIsCurrent)
+{
+    const ToolRun run = runTool({"properties", "--markdown"});
+    ASSERT_EQ(run.status, 0) << run.err;
+    EXPECT_EQ(run.out, readFile(std::string(VELTO_DOCS_DIR) + "/properties.md"))
+        << "docs/properties.md is out of date; write it again with: veltotouch properties --markdown > "
+           "docs/properties.md";
+}
