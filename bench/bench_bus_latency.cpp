@@ -17,7 +17,7 @@
 #include "PrivateBus.h"
 
 #include "host/BusService.h"
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 #include "platform/Log.h"
 #include "platform/MonotonicClock.h"
 #include "recording/PipelineRecording.h"

@@ -1,4 +1,4 @@
-// bench-libs: veltotouch_pipeline veltotouch_algs
+// bench-libs: veltotouch_pipeline
 //
 // One Image report through the pipeline and the recogniser, debug log off,
 // on a stream that mixes idle stretches, taps, holds and a palm.

@@ -12,7 +12,7 @@
 // Reports are spaced so that every thread is asleep when the next one comes,
 // as with the real device's frame rate; each benchmark runs its samples once
 // and reports percentiles as counters in microseconds.
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 #include "platform/HostDeviceRegistry.h"
 #include "platform/Log.h"
 #include "platform/MonotonicClock.h"

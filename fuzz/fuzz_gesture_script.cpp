@@ -8,7 +8,7 @@
 #include "GestureScript.h"
 #include "Synthesizer.h"
 #include "ToolError.h"
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 #include "recording/PipelineRecording.h"
 
 #include <algorithm>

@@ -21,9 +21,9 @@
 // little-endian), 9 string, 10 byte data (each LEN and bytes), 11 JSON text
 // (LEN and text; malformed text gives no value).
 #include "FuzzInput.h"
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 #include "pipeline/Pipeline.h"
-#include "pipeline/Util.h"
+#include "records/DomainKey.h"
 #include "platform/HidEvent.h"
 #include "platform/PropertyDictionary.h"
 #include "recording/JsonValue.h"

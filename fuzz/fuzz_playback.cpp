@@ -9,7 +9,7 @@
 #include "FuzzInput.h"
 #include "pipeline/Pipeline.h"
 #include "pipeline/PipelineInput.h"
-#include "pipeline/Util.h"
+#include "records/TickConversion.h"
 #include "platform/MonotonicClock.h"
 #include "recording/PipelineRecording.h"
 

@@ -2,8 +2,8 @@
 
 #include "ToolError.h"
 #include "ToolFiles.h"
-#include "pipeline/InputReport.h"
-#include "pipeline/Util.h"
+#include "records/InputReport.h"
+#include "ImageDrawing.h"
 #include "recording/PipelineRecording.h"
 
 #include <charconv>

@@ -1,7 +1,7 @@
 #include "EventFormatter.h"
 
 #include "host/GestureFields.h"
-#include "pipeline/Util.h"
+#include "records/TickConversion.h"
 #include "recording/JsonValue.h"
 
 #include <nlohmann/json.hpp>

@@ -1,7 +1,7 @@
 #include "Synthesizer.h"
 
-#include "pipeline/InputReport.h"
-#include "pipeline/Util.h"
+#include "records/InputReport.h"
+#include "records/TickConversion.h"
 
 #include <algorithm>
 #include <cstdlib>

@@ -1,7 +1,7 @@
 #include "algs/Algs.h"
 
 #include "algs/DecisionDump.h"
-#include "pipeline/Util.h"
+#include "records/DomainKey.h"
 #include "platform/PropertyDictionary.h"
 
 #include <sstream>

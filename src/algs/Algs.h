@@ -9,7 +9,7 @@
 #include "algs/TouchPhase.h"
 #include "algs/VirtualImage.h"
 #include "algs/VirtualPixel.h"
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 #include "platform/HidEvent.h"
 #include "platform/Log.h"
 #include "platform/PropertyValue.h"

@@ -4,7 +4,7 @@
 #include "algs/PixelRegion.h"
 #include "algs/TouchPhase.h"
 #include "algs/VirtualImage.h"
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 #include "platform/HidEvent.h"
 
 #include <array>

@@ -1,6 +1,6 @@
 #include "pipeline/Pipeline.h"
 
-#include "pipeline/Util.h"
+#include "records/DomainKey.h"
 #include "platform/PropertyDictionary.h"
 
 namespace VeltoTouch {

@@ -1,7 +1,7 @@
 #pragma once
 
 #include "algs/Algs.h"
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 #include "pipeline/PipelineInput.h"
 #include "pipeline/PipelineOutput.h"
 #include "platform/HidEvent.h"

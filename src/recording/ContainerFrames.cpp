@@ -1,6 +1,6 @@
 #include "recording/ContainerFrames.h"
 
-#include "pipeline/Util.h"
+#include "records/HexText.h"
 #include "platform/PropertyDictionary.h"
 
 #include <array>

@@ -1,6 +1,6 @@
 #include "recording/ContainerWriter.h"
 
-#include "pipeline/Util.h"
+#include "records/HexText.h"
 #include "recording/JsonValue.h"
 
 #include <nlohmann/json.hpp>

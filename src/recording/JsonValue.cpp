@@ -2,7 +2,7 @@
 
 #include "recording/PropertyValueBuilder.h"
 
-#include "pipeline/Util.h"
+#include "records/HexText.h"
 #include "platform/PropertyDictionary.h"
 
 #include <nlohmann/json.hpp>

@@ -1,6 +1,6 @@
 #include "recording/PipelineRecording.h"
 
-#include "pipeline/Util.h"
+#include "records/TickConversion.h"
 #include "platform/MonotonicClock.h"
 #include "platform/PropertyDictionary.h"
 #include "recording/ContainerFrames.h"

@@ -1,7 +1,7 @@
 #include "report/ReportCollector.h"
 
 #include "host/GestureFields.h"
-#include "pipeline/Util.h"
+#include "records/TickConversion.h"
 #include "recording/JsonValue.h"
 
 #include <algorithm>

@@ -2,9 +2,10 @@
 
 #include "service/ServicePropertyKey.h"
 
-#include "pipeline/FeatureReport.h"
-#include "pipeline/InputReport.h"
-#include "pipeline/Util.h"
+#include "records/FeatureReport.h"
+#include "records/InputReport.h"
+#include "records/DomainKey.h"
+#include "records/HexText.h"
 #include "platform/HidEvent.h"
 #include "platform/LogFormat.h"
 #include "platform/PropertyDictionary.h"

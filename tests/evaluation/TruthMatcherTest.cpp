@@ -1,6 +1,6 @@
 #include "evaluation/TruthMatcher.h"
 
-#include "pipeline/Util.h"
+#include "records/TickConversion.h"
 
 #include <gtest/gtest.h>
 

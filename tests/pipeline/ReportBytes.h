@@ -1,6 +1,6 @@
 #pragma once
 
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 
 #include <array>
 #include <cstdint>

@@ -1,6 +1,6 @@
 #include "RecordingTestSupport.h"
 
-#include "pipeline/Util.h"
+#include "records/HexText.h"
 #include "platform/PropertyDictionary.h"
 #include "recording/ContainerWriter.h"
 #include "recording/JsonValue.h"

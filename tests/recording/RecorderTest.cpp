@@ -1,6 +1,6 @@
 #include "RecordingTestSupport.h"
 
-#include "pipeline/Util.h"
+#include "records/TickConversion.h"
 #include "platform/MonotonicClock.h"
 
 #include <gtest/gtest.h>

@@ -2,7 +2,7 @@
 // queue: reports in, events out at the host's callback, one delivery job per
 // report, and the log lines of one whole cycle.
 
-#include "pipeline/Util.h"
+#include "records/TickConversion.h"
 #include "platform/CaptureLogSink.h"
 #include "platform/Log.h"
 #include "platform/Trace.h"

@@ -1,6 +1,6 @@
 #include "service/ServiceHarness.h"
 
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 #include "platform/HostDeviceRegistry.h"
 #include "platform/MonotonicClock.h"
 #include "platform/PropertyDictionary.h"

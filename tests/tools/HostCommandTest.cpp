@@ -1,6 +1,6 @@
 #include "ToolProcessSupport.h"
 #include "ToolTestSupport.h"
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 #include "recording/PipelineRecording.h"
 
 #include <gtest/gtest.h>

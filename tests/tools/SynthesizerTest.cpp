@@ -1,6 +1,6 @@
 #include "GestureScript.h"
 #include "Synthesizer.h"
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 
 #include <gtest/gtest.h>
 

@@ -1,4 +1,4 @@
-#include "pipeline/Util.h"
+#include "records/TickConversion.h"
 #include "platform/MonotonicClock.h"
 
 #include <gtest/gtest.h>

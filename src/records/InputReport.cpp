@@ -1,6 +1,6 @@
-#include "pipeline/InputReport.h"
+#include "records/InputReport.h"
 
-#include "pipeline/LittleEndian.h"
+#include "records/LittleEndian.h"
 
 #include <algorithm>
 

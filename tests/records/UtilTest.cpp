@@ -1,4 +1,6 @@
-#include "pipeline/Util.h"
+#include "records/DomainKey.h"
+#include "records/TickConversion.h"
+#include "records/HexText.h"
 
 #include <gtest/gtest.h>
 

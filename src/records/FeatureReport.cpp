@@ -1,6 +1,6 @@
-#include "pipeline/FeatureReport.h"
+#include "records/FeatureReport.h"
 
-#include "pipeline/LittleEndian.h"
+#include "records/LittleEndian.h"
 
 namespace VeltoTouch::FeatureReport {
 

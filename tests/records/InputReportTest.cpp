@@ -1,5 +1,5 @@
-#include "pipeline/FeatureReport.h"
-#include "pipeline/InputReport.h"
+#include "records/FeatureReport.h"
+#include "records/InputReport.h"
 
 #include <gtest/gtest.h>
 
