@@ -77,13 +77,11 @@ VeltoTouchHIDService::VeltoTouchHIDService()
 VeltoTouchHIDService::~VeltoTouchHIDService()
 {
     _log.debug("%@", "dealloc");
-    if (_inputReportRunLoop) {
+    if (_inputReportThread.running()) {
         // The host unschedules before its last release. Should it not have,
         // the thread must still not outlive the object it works on.
-        _inputReportRunLoop->performJob(kHandleInputReportsRunLoopMode, [] { RunLoop::stopCurrent(); });
-        _inputReportRunLoop->wakeUp();
-        _inputReportRunLoop.reset();
-        if (_inputReportThreadSignal) _inputReportThreadSignal->wait();
+        _inputReportThread.requestStop(kHandleInputReportsRunLoopMode);
+        _inputReportThread.waitUntilStopped();
     }
     _veltoDevice.reset();
 }
@@ -149,42 +147,25 @@ void VeltoTouchHIDService::scheduleWithDispatchQueue(const SerialQueue::Ref& que
     _log.debug("%@", "scheduleWithDispatchQueue:");
     _dispatchEventInfo.queue = queue;
     _dispatchEventInfo.sender = getServiceInterface();
-    DispatchEventInfo info = _dispatchEventInfo;
-    _inputReportThreadSignal = Semaphore::create(0);
-    // The thread gets its own references to the device and the semaphore so
-    // that it never reads members the host thread may change meanwhile.
-    Semaphore::Ref signal = _inputReportThreadSignal;
-    HostDevice::Ref device = _veltoDevice;
-    const bool started = Thread::startDetached(
-        [this, info, device, signal]() mutable {
-            runInputReportThread(std::move(info), std::move(device), std::move(signal));
-        },
-        "VeltoInputReport");
-    if (!started) {
-        // Nothing will ever signal: waiting would hang the host's thread. The
-        // service stays unscheduled (no event loop, no handshake), so a later
-        // unschedule, stop or release has nothing to wait for either.
-        _log.error("input report thread could not be started; no reports will be received");
-        _inputReportThreadSignal.reset();
-        _dispatchEventInfo.queue.reset();
-        return;
-    }
-    signal->wait();
-}
-
-void VeltoTouchHIDService::runInputReportThread(DispatchEventInfo info, HostDevice::Ref device, Semaphore::Ref signal)
-{
-    // The service may be destroyed as soon as the second signal is seen, so
-    // the last line goes through a copy of the log handle.
+    // The thread gets its own references to the device and the queue so that
+    // it never reads members the host thread may change meanwhile; they go
+    // with its run step, before unscheduling hears that the thread is done.
+    // The service may be destroyed as soon as that is heard, so the last line
+    // goes through a copy of the log handle.
     const Log log = _log;
-    log.debug("input report thread start");
-    _inputReportRunLoop = RunLoop::current();
-    signal->signal();
-    // The thread's references to the queue and the device go with the call,
-    // before unscheduling hears that the thread is done.
-    handleInputReports(std::move(info), std::move(device));
-    signal->signal();
-    log.debug("input report thread end");
+    const bool started = _inputReportThread.start(
+        "VeltoInputReport",
+        {[log] { log.debug("input report thread start"); },
+         [this, info = _dispatchEventInfo, device = _veltoDevice]() mutable {
+             handleInputReports(std::move(info), std::move(device));
+         },
+         [log] { log.debug("input report thread end"); }});
+    if (!started) {
+        // The service stays unscheduled (no event loop, no handshake), so a
+        // later unschedule, stop or release has nothing to wait for either.
+        _log.error("input report thread could not be started; no reports will be received");
+        _dispatchEventInfo.queue.reset();
+    }
 }
 
 void VeltoTouchHIDService::handleInputReports(DispatchEventInfo info, HostDevice::Ref device)
@@ -287,14 +268,11 @@ void VeltoTouchHIDService::clearPipelineProbes()
 void VeltoTouchHIDService::unscheduleWithDispatchQueue(const SerialQueue::Ref&)
 {
     _log.debug("%@", "unscheduleWithDispatchQueue:");
-    if (_inputReportRunLoop) {
+    if (_inputReportThread.running()) {
         _log.debug("signalling input report thread to exit");
-        _inputReportRunLoop->performJob(kHandleInputReportsRunLoopMode, [] { RunLoop::stopCurrent(); });
-        _inputReportRunLoop->wakeUp();
-        _inputReportRunLoop.reset();
+        _inputReportThread.requestStop(kHandleInputReportsRunLoopMode);
         _log.debug("waiting for input report thread to exit");
-        if (_inputReportThreadSignal) _inputReportThreadSignal->wait();
-        _inputReportThreadSignal.reset();
+        _inputReportThread.waitUntilStopped();
         _log.debug("input report thread exited");
     }
     _dispatchEventInfo.queue.reset();

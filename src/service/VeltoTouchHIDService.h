@@ -4,7 +4,7 @@
 #include "platform/HostDevice.h"
 #include "platform/Log.h"
 #include "platform/RunLoop.h"
-#include "platform/Semaphore.h"
+#include "platform/InputReportThread.h"
 #include "platform/SerialQueue.h"
 #include "recording/PipelineRecording.h"
 #include "service/VeltoHIDService.h"
@@ -78,8 +78,6 @@ private:
                                               const std::uint8_t* report, std::size_t reportLength,
                                               std::uint64_t timeStamp)>;
 
-    void runInputReportThread(DispatchEventInfo info, VeltoHost::HostDevice::Ref device,
-                              VeltoHost::Semaphore::Ref signal);
     void handleInputReports(DispatchEventInfo info, VeltoHost::HostDevice::Ref device);
     void handleInputReport(const std::uint8_t* report, std::size_t reportLength);
     void installPipelineProbes(const DispatchEventInfo& info);
@@ -96,8 +94,7 @@ private:
 
     VeltoHost::Log _log;
     VeltoHost::HostDevice::Ref _veltoDevice;
-    VeltoHost::RunLoop::Ref _inputReportRunLoop;
-    VeltoHost::Semaphore::Ref _inputReportThreadSignal;
+    VeltoHost::InputReportThread _inputReportThread;
     DispatchEventInfo _dispatchEventInfo;
     std::mutex _pipelineLock;
     std::shared_ptr<Pipeline> _pipeline;

@@ -10,7 +10,7 @@
 #include "platform/PluginInterface.h"
 #include "platform/PropertyDictionary.h"
 #include "platform/RunLoop.h"
-#include "platform/Semaphore.h"
+#include "platform/InputReportThread.h"
 #include "platform/SerialQueue.h"
 #include "platform/Thread.h"
 
@@ -143,30 +143,19 @@ private:
         EchoService* service = &from(self);
         service->_dispatch.queue = queue ? queue->shared_from_this() : nullptr;
         service->_dispatch.sender = &service->_serviceInterface;
-        service->_threadSignal = Semaphore::create(0);
-        Thread::startDetached(
-            [service, info = service->_dispatch]() mutable {
-                service->_runLoop = RunLoop::current();
-                Semaphore::Ref signal = service->_threadSignal;
-                signal->signal();
-                // Moved in: the queue reference is gone before the exit signal.
-                service->handleInputReports(std::move(info));
-                signal->signal();
-            },
-            "echo.reports");
-        service->_threadSignal->wait();
+        service->_thread.start("echo.reports", {nullptr,
+                                                [service, info = service->_dispatch]() mutable {
+                                                    // Moved in: the queue reference is gone before the exit signal.
+                                                    service->handleInputReports(std::move(info));
+                                                },
+                                                nullptr});
     }
     static void unschedule(VeltoInterfaceRef self, SerialQueue*)
     {
         logCall("unscheduleFromDispatchQueue");
         EchoService& service = from(self);
-        if (service._runLoop) {
-            service._runLoop->performJob(kEchoMode, [] { RunLoop::stopCurrent(); });
-            service._runLoop->wakeUp();
-            service._runLoop.reset();
-            service._threadSignal->wait();
-            service._threadSignal.reset();
-        }
+        service._thread.requestStop(kEchoMode);
+        service._thread.waitUntilStopped();
         service._dispatch.queue.reset();
     }
     static HidEventRef copyEvent(VeltoInterfaceRef, std::uint32_t, HidEvent*, std::uint32_t) { return nullptr; }
@@ -204,8 +193,7 @@ private:
 
     // Host thread, or the input-report thread between the handshakes.
     HostDevice::Ref _device;
-    RunLoop::Ref _runLoop;
-    Semaphore::Ref _threadSignal;
+    InputReportThread _thread;
     DispatchInfo _dispatch;
 };
 
