@@ -59,17 +59,7 @@ HidrawHostDevice::HidrawHostDevice(int fd, bool numberedReports) : _log("HostDev
     _numberedReports = numberedReports;
 }
 
-HidrawHostDevice::~HidrawHostDevice()
-{
-    std::shared_ptr<RunLoop> runLoop;
-    RunLoop::SourceId source = 0;
-    {
-        std::lock_guard<std::mutex> guard(_lock);
-        runLoop = std::move(_runLoop);
-        source = std::exchange(_source, 0);
-    }
-    if (runLoop && source != 0) runLoop->removeSource(source);
-}
+HidrawHostDevice::~HidrawHostDevice() { detachSource(true); }
 
 bool HidrawHostDevice::open(std::uint32_t options)
 {
@@ -96,25 +86,22 @@ bool HidrawHostDevice::open(std::uint32_t options)
         }
     }
     _open = true;
-    attachSourceLocked();
+    if (_source == 0 && _runLoop) _source = attachSourceLocked();
     return true;
 }
 
 void HidrawHostDevice::close(std::uint32_t /*options*/)
 {
-    std::shared_ptr<RunLoop> runLoop;
-    RunLoop::SourceId source = 0;
+    TakenSource taken;
     {
         std::lock_guard<std::mutex> guard(_lock);
         _open = false;
         // An adopted descriptor stays with this object; a path is reopened.
         if (_path.empty()) return;
         _descriptor.reset();
-        runLoop = _runLoop;
-        source = std::exchange(_source, 0);
+        taken = takeSourceLocked(false);
     }
-    // Outside the lock: removal waits for a running delivery, which takes it.
-    if (runLoop && source != 0) runLoop->removeSource(source);
+    taken.remove();
 }
 
 std::int32_t HidrawHostDevice::getReport(HidReportType type, std::uint32_t reportID, std::uint8_t* buffer,
@@ -171,50 +158,6 @@ bool HidrawHostDevice::setProperty(const std::string& key, const PropertyValue& 
     return true;
 }
 
-void HidrawHostDevice::registerInputReportWithTimeStampCallback(std::uint8_t* buffer, std::size_t bufferSize,
-                                                                HostDeviceInputReportCallback callback,
-                                                                void* context)
-{
-    std::lock_guard<std::recursive_mutex> delivery(_deliveryLock);
-    std::lock_guard<std::mutex> guard(_lock);
-    _buffer = buffer;
-    _bufferSize = buffer ? bufferSize : 0;
-    _callback = callback;
-    _context = context;
-}
-
-void HidrawHostDevice::scheduleWithRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode)
-{
-    if (!runLoop) return;
-    std::shared_ptr<RunLoop> previousLoop;
-    RunLoop::SourceId previousSource = 0;
-    {
-        std::lock_guard<std::mutex> guard(_lock);
-        previousLoop = std::move(_runLoop);
-        previousSource = std::exchange(_source, 0);
-    }
-    if (previousLoop && previousSource != 0) previousLoop->removeSource(previousSource);
-
-    std::lock_guard<std::mutex> guard(_lock);
-    _runLoop = runLoop;
-    _mode = mode;
-    attachSourceLocked();
-}
-
-void HidrawHostDevice::unscheduleFromRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode)
-{
-    std::shared_ptr<RunLoop> scheduledLoop;
-    RunLoop::SourceId source = 0;
-    {
-        std::lock_guard<std::mutex> guard(_lock);
-        if (_runLoop != runLoop || _mode != mode) return;
-        scheduledLoop = std::move(_runLoop);
-        source = std::exchange(_source, 0);
-        _mode.clear();
-    }
-    if (source != 0) scheduledLoop->removeSource(source);
-}
-
 bool HidrawHostDevice::isGone() const
 {
     std::lock_guard<std::mutex> guard(_lock);
@@ -239,10 +182,10 @@ bool HidrawHostDevice::descriptorUsesReportIDs(const std::uint8_t* descriptor, s
     return false;
 }
 
-void HidrawHostDevice::attachSourceLocked()
+RunLoop::SourceId HidrawHostDevice::attachSourceLocked()
 {
-    if (_source != 0 || !_runLoop || !_descriptor || _gone) return;
-    _source = _runLoop->addFileDescriptorSource(_descriptor->fd, _mode, [this] { onReadable(); });
+    if (!_descriptor || _gone) return 0;
+    return _runLoop->addFileDescriptorSource(_descriptor->fd, _mode, [this] { onReadable(); });
 }
 
 // Runs on the scheduled loop's thread, once per readable event: one read is
@@ -269,39 +212,29 @@ void HidrawHostDevice::onReadable()
         return;
     }
 
-    HostDeviceInputReportCallback callback = nullptr;
-    std::uint8_t* buffer = nullptr;
-    std::size_t length = 0;
-    void* context = nullptr;
+    Receiver receiver;
     bool numbered = true;
     {
         std::lock_guard<std::mutex> guard(_lock);
         // Reports of a closed device, or with nobody listening, are read and dropped.
-        if (!_open || _callback == nullptr) return;
-        callback = _callback;
-        buffer = _buffer;
-        context = _context;
-        length = std::min(static_cast<std::size_t>(count), _bufferSize);
+        if (!_open || _receiver.callback == nullptr) return;
+        receiver = _receiver;
         numbered = _numberedReports;
     }
-    if (length > 0) std::memcpy(buffer, _readBuffer.data(), length);
-    std::uint32_t reportID = numbered ? _readBuffer[0] : 0;
-    callback(context, kHostDeviceSuccess, this, HidReportType::Input, reportID, buffer, length, timeStamp);
+    deliver(receiver, _readBuffer.data(), static_cast<std::size_t>(count), numbered ? _readBuffer[0] : 0, timeStamp);
 }
 
 void HidrawHostDevice::endReception(int error)
 {
-    std::shared_ptr<RunLoop> runLoop;
-    RunLoop::SourceId source = 0;
+    TakenSource taken;
     {
         std::lock_guard<std::mutex> guard(_lock);
         if (_gone) return;
         _gone = true;
-        runLoop = _runLoop;
-        source = std::exchange(_source, 0);
+        taken = takeSourceLocked(false);
     }
     // On the loop's own thread, from inside this source's callback: no wait.
-    if (runLoop && source != 0) runLoop->removeSource(source);
+    taken.remove();
     _log.log("%s disappeared (%s); input reports stopped", name(),
              error == 0 ? std::string("end of file") : std::string(std::strerror(error)));
 }

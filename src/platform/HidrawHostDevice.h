@@ -1,8 +1,7 @@
 #pragma once
 
-#include "platform/HostDevice.h"
+#include "platform/ScheduledHostDevice.h"
 #include "platform/Log.h"
-#include "platform/RunLoop.h"
 
 #include <cstdint>
 #include <map>
@@ -22,7 +21,7 @@ namespace VeltoHost {
 //
 // A device that disappears (a read gives 0 bytes, ENODEV or EIO) ends report
 // reception with one log line; later operations report kHostDeviceNoDevice.
-class HidrawHostDevice : public HostDevice {
+class HidrawHostDevice : public ScheduledHostDevice {
 public:
     // Opened by open() from `path`, read-write when allowed, else read-only.
     explicit HidrawHostDevice(std::string path);
@@ -41,10 +40,6 @@ public:
                            std::size_t& length) override;
     PropertyValue getProperty(const std::string& key) override;
     bool setProperty(const std::string& key, const PropertyValue& value) override;
-    void registerInputReportWithTimeStampCallback(std::uint8_t* buffer, std::size_t bufferSize,
-                                                  HostDeviceInputReportCallback callback, void* context) override;
-    void scheduleWithRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode) override;
-    void unscheduleFromRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode) override;
 
     bool isGone() const;
 
@@ -62,7 +57,7 @@ private:
 
     void onReadable();
     void endReception(int error);
-    void attachSourceLocked();
+    RunLoop::SourceId attachSourceLocked() override;
     std::string name() const;
     static PropertyValue queryProperty(int fd, const std::string& key);
     static std::int32_t statusForErrno(int error);
@@ -70,25 +65,12 @@ private:
     const std::string _path;  // empty for an adopted descriptor
     const Log _log;
 
-    // Held across one delivery (copy into the buffer and callback), so that
-    // a registration made on another thread never swaps the buffer under a
-    // running delivery. Recursive: the callback may register again.
-    std::recursive_mutex _deliveryLock;
-
-    mutable std::mutex _lock;
     // Guarded by _lock.
     DescriptorRef _descriptor;
     bool _open = false;
     bool _gone = false;
     bool _numberedReports = true;
     std::map<std::string, PropertyValue> _propertyOverrides;
-    std::shared_ptr<RunLoop> _runLoop;
-    std::string _mode;
-    RunLoop::SourceId _source = 0;
-    std::uint8_t* _buffer = nullptr;
-    std::size_t _bufferSize = 0;
-    HostDeviceInputReportCallback _callback = nullptr;
-    void* _context = nullptr;
 
     // Owned by the scheduled loop's thread.
     std::vector<std::uint8_t> _readBuffer;

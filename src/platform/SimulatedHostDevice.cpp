@@ -16,14 +16,7 @@ SimulatedHostDevice::SimulatedHostDevice() : _eventFd(eventfd(0, EFD_NONBLOCK | 
 
 SimulatedHostDevice::~SimulatedHostDevice()
 {
-    std::shared_ptr<RunLoop> runLoop;
-    RunLoop::SourceId source = 0;
-    {
-        std::lock_guard<std::mutex> guard(_lock);
-        runLoop = std::move(_runLoop);
-        source = std::exchange(_source, 0);
-    }
-    if (runLoop && source != 0) runLoop->removeSource(source);
+    detachSource(true);
     if (_eventFd >= 0) ::close(_eventFd);
 }
 
@@ -81,56 +74,19 @@ bool SimulatedHostDevice::setProperty(const std::string& key, const PropertyValu
     return true;
 }
 
-void SimulatedHostDevice::registerInputReportWithTimeStampCallback(std::uint8_t* buffer, std::size_t bufferSize,
-                                                                   HostDeviceInputReportCallback callback,
-                                                                   void* context)
+RunLoop::SourceId SimulatedHostDevice::attachSourceLocked()
 {
-    std::lock_guard<std::recursive_mutex> delivery(_deliveryLock);
-    std::lock_guard<std::mutex> guard(_lock);
-    _buffer = buffer;
-    _bufferSize = buffer ? bufferSize : 0;
-    _callback = callback;
-    _context = context;
+    return _runLoop->addFileDescriptorSource(_eventFd, _mode, [this] { deliverOne(); });
+}
+
+void SimulatedHostDevice::deliveryMayStartLocked()
+{
     if (deliverableLocked() && !_pending.empty()) signalLocked();
 }
 
-void SimulatedHostDevice::scheduleWithRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode)
-{
-    if (!runLoop) return;
-    std::shared_ptr<RunLoop> previousLoop;
-    RunLoop::SourceId previousSource = 0;
-    {
-        std::lock_guard<std::mutex> guard(_lock);
-        previousLoop = std::move(_runLoop);
-        previousSource = std::exchange(_source, 0);
-    }
-    // Removed outside the lock: removal waits for a running delivery, which takes the lock.
-    if (previousLoop && previousSource != 0) previousLoop->removeSource(previousSource);
+void SimulatedHostDevice::scheduleRequestedLocked() { ++_counters.schedules; }
 
-    RunLoop::SourceId source = runLoop->addFileDescriptorSource(_eventFd, mode, [this] { deliverOne(); });
-    std::lock_guard<std::mutex> guard(_lock);
-    ++_counters.schedules;
-    if (source == 0) return;
-    _runLoop = runLoop;
-    _mode = mode;
-    _source = source;
-    if (deliverableLocked() && !_pending.empty()) signalLocked();
-}
-
-void SimulatedHostDevice::unscheduleFromRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode)
-{
-    std::shared_ptr<RunLoop> scheduledLoop;
-    RunLoop::SourceId source = 0;
-    {
-        std::lock_guard<std::mutex> guard(_lock);
-        ++_counters.unschedules;
-        if (_source == 0 || _runLoop != runLoop || _mode != mode) return;
-        scheduledLoop = std::move(_runLoop);
-        source = std::exchange(_source, 0);
-        _mode.clear();
-    }
-    scheduledLoop->removeSource(source);
-}
+void SimulatedHostDevice::unscheduleRequestedLocked() { ++_counters.unschedules; }
 
 void SimulatedHostDevice::pushInputReport(std::vector<std::uint8_t> report)
 {
@@ -222,7 +178,7 @@ bool SimulatedHostDevice::isScheduled() const
 bool SimulatedHostDevice::hasCallback() const
 {
     std::lock_guard<std::mutex> guard(_lock);
-    return _callback != nullptr;
+    return _receiver.callback != nullptr;
 }
 
 std::size_t SimulatedHostDevice::pendingReportCount() const
@@ -245,7 +201,7 @@ bool SimulatedHostDevice::waitForDelivered(std::uint64_t count, std::chrono::nan
 
 bool SimulatedHostDevice::deliverableLocked() const
 {
-    return _open && !_unplugged && _source != 0 && _callback != nullptr;
+    return _open && !_unplugged && _source != 0 && _receiver.callback != nullptr;
 }
 
 void SimulatedHostDevice::signalLocked()
@@ -266,24 +222,17 @@ void SimulatedHostDevice::deliverOne()
 
     std::lock_guard<std::recursive_mutex> delivery(_deliveryLock);
     PendingReport report;
-    HostDeviceInputReportCallback callback = nullptr;
-    std::uint8_t* buffer = nullptr;
-    std::size_t length = 0;
-    void* context = nullptr;
+    Receiver receiver;
     {
         std::lock_guard<std::mutex> guard(_lock);
         if (!deliverableLocked() || _pending.empty()) return;
         report = std::move(_pending.front());
         _pending.pop_front();
         _delivering = true;
-        callback = _callback;
-        buffer = _buffer;
-        context = _context;
-        length = std::min(report.bytes.size(), _bufferSize);
+        receiver = _receiver;
     }
-    if (length > 0) std::memcpy(buffer, report.bytes.data(), length);
-    std::uint32_t reportID = report.bytes.empty() ? 0 : report.bytes[0];
-    callback(context, kHostDeviceSuccess, this, HidReportType::Input, reportID, buffer, length, report.timeStamp);
+    const std::uint32_t reportID = report.bytes.empty() ? 0 : report.bytes[0];
+    deliver(receiver, report.bytes.data(), report.bytes.size(), reportID, report.timeStamp);
     {
         std::lock_guard<std::mutex> guard(_lock);
         _delivering = false;

@@ -1,7 +1,6 @@
 #pragma once
 
-#include "platform/HostDevice.h"
-#include "platform/RunLoop.h"
+#include "platform/ScheduledHostDevice.h"
 
 #include <chrono>
 #include <condition_variable>
@@ -31,7 +30,7 @@ namespace VeltoHost {
 //
 // Feature reports and properties come from tables the test fills; failures
 // can be injected; counters tell the test what the plug-in did.
-class SimulatedHostDevice : public HostDevice {
+class SimulatedHostDevice : public ScheduledHostDevice {
 public:
     using Ref = std::shared_ptr<SimulatedHostDevice>;
 
@@ -64,10 +63,6 @@ public:
     // Stores into the property table (the same table the test fills) unless
     // writes are refused with refusePropertyWrites().
     bool setProperty(const std::string& key, const PropertyValue& value) override;
-    void registerInputReportWithTimeStampCallback(std::uint8_t* buffer, std::size_t bufferSize,
-                                                  HostDeviceInputReportCallback callback, void* context) override;
-    void scheduleWithRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode) override;
-    void unscheduleFromRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode) override;
 
     // Input. The report ID given to the callback is the first byte (0 for an
     // empty report).
@@ -113,14 +108,12 @@ private:
     void signalLocked();
     void deliverOne();
 
+    RunLoop::SourceId attachSourceLocked() override;
+    void deliveryMayStartLocked() override;
+    void scheduleRequestedLocked() override;
+    void unscheduleRequestedLocked() override;
+
     const int _eventFd;
-
-    // Held across one delivery (copy into the buffer and callback), so that
-    // a registration made on another thread never swaps the buffer under a
-    // running delivery. Recursive: the callback may register again.
-    std::recursive_mutex _deliveryLock;
-
-    mutable std::mutex _lock;
     std::condition_variable _progress;
     // Guarded by _lock.
     Counters _counters;
@@ -134,13 +127,6 @@ private:
     std::map<std::string, PropertyValue> _properties;
     std::deque<PendingReport> _pending;
     bool _delivering = false;  // a report was taken and its callback has not returned yet
-    std::uint8_t* _buffer = nullptr;
-    std::size_t _bufferSize = 0;
-    HostDeviceInputReportCallback _callback = nullptr;
-    void* _context = nullptr;
-    std::shared_ptr<RunLoop> _runLoop;
-    std::string _mode;
-    RunLoop::SourceId _source = 0;
 };
 
 }  // namespace VeltoHost
