@@ -1,4 +1,4 @@
-#include "ReportBytes.h"
+#include "records/ReportBytes.h"
 #include "pipeline/Pipeline.h"
 #include "platform/PropertyDictionary.h"
 

@@ -98,8 +98,8 @@ std::vector<Frame> framesWithEveryKindOfValue()
         unknownType,
         reportFrame(17, {}),
         reportFrame(18, {0x01, 0xA0, 0xFF}),
-        reportFrame(std::numeric_limits<std::uint64_t>::max(), imageReport(4, 1030, {300, -300, 32767, -32768})),
-        reportFrame(0, firmwareEventReport(0)),
+        reportFrame(std::numeric_limits<std::uint64_t>::max(), ReportBytes::image(4, 1030, {300, -300, 32767, -32768})),
+        reportFrame(0, ReportBytes::firmwareEvent(0)),
     };
 }
 

@@ -173,7 +173,7 @@ TEST(RecordingTrim, WithAStateWritePerReportTrimmingIsPaidOncePerLimitAppends)
     constexpr std::uint64_t kAppends = 40 * kLimit;
     PipelineRecording recording;
     recording.setMaxFrameCount(kLimit);
-    const auto report = imageReport(1, 0);
+    const auto report = ReportBytes::image(1, 0);
     std::uint64_t trims = 0;
     std::size_t longest = 0;
     for (std::uint64_t i = 0; i < kAppends; ++i) {
@@ -217,7 +217,7 @@ TEST(Recorder, RecordsEachCallWithOneClockReadingAndForwardsIt)
     const std::uint64_t before = MonotonicClock::now();
     recording.setState("Algs.Key", value);
     recording.setState("Algs.Empty", PropertyValue());
-    const auto image = imageReport(1, 2);
+    const auto image = ReportBytes::image(1, 2);
     recording.handleInputReport(image.data(), image.size());
     recording.handleInputReport(nullptr, 0);
     recording.setTime(123456);
@@ -258,7 +258,7 @@ TEST(Recorder, CopiesShareInputAndValuesButOwnTheirFramesAndNoCursor)
     original.pipeline = log;
     original.setMaxFrameCount(7);
     original.setState("k", PropertyValue::string("v"));
-    const auto image = imageReport(1, 2);
+    const auto image = ReportBytes::image(1, 2);
     original.handleInputReport(image.data(), image.size());
     original.playReset();
     ASSERT_TRUE(original.playCanContinue());

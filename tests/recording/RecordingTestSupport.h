@@ -1,6 +1,7 @@
 #pragma once
 
 #include "records/InputReport.h"
+#include "records/ReportBytes.h"
 #include "pipeline/PipelineInput.h"
 #include "recording/ContainerStream.h"
 #include "recording/PipelineRecording.h"
@@ -20,26 +21,6 @@ namespace RecordingTestSupport {
 using VeltoTouch::PipelineRecording;
 using VeltoTouch::PropertyValue;
 using Frame = PipelineRecording::Frame;
-
-// Raw image report with the given pad readings.
-inline std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs,
-                                             const std::array<std::int16_t, 15>& readings = {})
-{
-    VeltoTouch::InputReport::Image image;
-    image.frameNumber = frameNumber;
-    image.timeMs = timeMs;
-    image.readings = readings;
-    return image.toReport();
-}
-
-// Firmware event report: ID 0x02, event code, 8 context bytes. Code 0 is a
-// device reset.
-inline std::vector<std::uint8_t> firmwareEventReport(std::uint8_t code)
-{
-    std::vector<std::uint8_t> bytes{0x02, code};
-    bytes.resize(10, 0xA5);
-    return bytes;
-}
 
 inline Frame stateFrame(std::uint64_t timestampNs, std::string key, PropertyValue value)
 {

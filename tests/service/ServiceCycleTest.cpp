@@ -67,12 +67,12 @@ TEST(ServiceCycle, ACycleDeliversOnTheQueueAndLogsItsStepsInOrder)
     {
         ServiceHarness harness;
         harness.bringUp();
-        harness.push(imageReport(7, 1000));
-        harness.push(imageReport(9, 1010));  // one frame missing
+        harness.push(ReportBytes::image(7, 1000));
+        harness.push(ReportBytes::image(9, 1010));  // one frame missing
         harness.push({});
         harness.push({0x05, 0x01});
-        harness.push(firmwareEventReport(1, 0x0102030405060708));  // not a reset: consumed silently
-        harness.push(deviceResetReport(0x1122334455667788));
+        harness.push(ReportBytes::firmwareEvent(1, 0x0102030405060708));  // not a reset: consumed silently
+        harness.push(ReportBytes::deviceReset(0x1122334455667788));
         ASSERT_TRUE(harness.collector.waitFor(1));
         harness.queue()->drain();
         harness.tearDown();
@@ -123,9 +123,9 @@ TEST(ServiceCycle, EventsArriveOnTheQueueInReportOrderOneJobPerReport)
     constexpr int kResets = 150;
     for (int i = 0; i < kResets; ++i) {
         const auto frame = static_cast<std::uint32_t>(i + 1);
-        harness.push(imageReport(frame, 10 * frame));
-        harness.push(deviceResetReport(static_cast<std::uint64_t>(i)));
-        harness.push(firmwareEventReport(3, static_cast<std::uint64_t>(i)));
+        harness.push(ReportBytes::image(frame, 10 * frame));
+        harness.push(ReportBytes::deviceReset(static_cast<std::uint64_t>(i)));
+        harness.push(ReportBytes::firmwareEvent(3, static_cast<std::uint64_t>(i)));
     }
     ASSERT_TRUE(harness.collector.waitFor(kResets));
     harness.queue()->drain();
@@ -167,14 +167,14 @@ TEST(ServiceCycle, AResetDuringAHoldGoesOutAsOneJobOfTwoEvents)
     ServiceHarness harness;
     harness.bringUp();
     for (std::uint32_t frame = 1; frame <= 103; ++frame) {
-        harness.push(frame <= 3 ? imageReport(frame, 1000 + 10 * frame)
-                                : imageReport(frame, 1000 + 10 * frame, {{kPadK, 300}}));
+        harness.push(frame <= 3 ? ReportBytes::image(frame, 1000 + 10 * frame)
+                                : ReportBytes::imageWithPads(frame, 1000 + 10 * frame, {{kPadK, 300}}));
     }
     ASSERT_TRUE(harness.collector.waitFor(2)) << "may-begin and hold start";
     harness.queue()->drain();
     const std::size_t batchesBefore = batches.sizes().size();
 
-    harness.push(deviceResetReport());
+    harness.push(ReportBytes::deviceReset());
     ASSERT_TRUE(harness.collector.waitFor(4));
     harness.queue()->drain();
     harness.tearDown();

@@ -133,26 +133,4 @@ bool ServiceHarness::waitForResetCount(std::uint32_t count) const
     return false;
 }
 
-std::vector<std::uint8_t> firmwareEventReport(std::uint8_t code, std::uint64_t context)
-{
-    InputReport::FirmwareEvent event{code, {}};
-    // Diagnostics read the context as one number, first byte most significant.
-    for (std::size_t i = 0; i < event.context.size(); ++i) {
-        event.context[i] = static_cast<std::uint8_t>(context >> (8 * (event.context.size() - 1 - i)));
-    }
-    return event.toReport();
-}
-
-std::vector<std::uint8_t> deviceResetReport(std::uint64_t context) { return firmwareEventReport(0, context); }
-
-std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs,
-                                      std::initializer_list<std::pair<int, std::int16_t>> readings)
-{
-    InputReport::Image image;
-    image.frameNumber = frameNumber;
-    image.timeMs = timeMs;
-    for (const auto& [pad, reading] : readings) image.readings.at(static_cast<std::size_t>(pad)) = reading;
-    return image.toReport();
-}
-
 }  // namespace VeltoTouch::Test

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "records/ReportBytes.h"
+
 #include "platform/HidEvent.h"
 #include "platform/PluginInterface.h"
 #include "platform/PropertyValue.h"
@@ -103,11 +105,5 @@ private:
     VeltoHost::VeltoInterfaceRef _service = nullptr;
 };
 
-// Report bytes.
-std::vector<std::uint8_t> deviceResetReport(std::uint64_t context = 0);
-std::vector<std::uint8_t> firmwareEventReport(std::uint8_t code, std::uint64_t context);
-// An image with every pad at 0 except those given (pad index, reading).
-std::vector<std::uint8_t> imageReport(std::uint32_t frameNumber, std::uint32_t timeMs,
-                                      std::initializer_list<std::pair<int, std::int16_t>> readings = {});
 
 }  // namespace VeltoTouch::Test

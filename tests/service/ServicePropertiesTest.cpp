@@ -69,8 +69,8 @@ TEST(ServiceProperties, ReadsAndWritesWhileReportsFlow)
     std::atomic<bool> done{false};
     std::thread pusher([&] {
         for (int i = 1; i <= kImages; ++i) {
-            harness.push(imageReport(static_cast<std::uint32_t>(i), static_cast<std::uint32_t>(10 * i)));
-            if (i % kResetEvery == 0) harness.push(deviceResetReport());
+            harness.push(ReportBytes::image(static_cast<std::uint32_t>(i), static_cast<std::uint32_t>(10 * i)));
+            if (i % kResetEvery == 0) harness.push(ReportBytes::deviceReset());
         }
         done = true;
     });
@@ -146,7 +146,7 @@ TEST(ServiceProperties, KeysAreRoutedByDomainAndName)
 
     // Diagnostic keys cannot be written: a write goes to the device and the
     // recording keeps its frames.
-    harness.push(deviceResetReport());
+    harness.push(ReportBytes::deviceReset());
     ASSERT_TRUE(harness.collector.waitFor(1));
     PropertyValue before = harness.copyProperty("Recording");
     EXPECT_TRUE(harness.setProperty("Recording", PropertyValue::string("x")));

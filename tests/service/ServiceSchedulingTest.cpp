@@ -27,7 +27,7 @@ TEST(ServiceScheduling, RepeatedCyclesDeliverWithTheCallbackOfTheirScheduling)
         harness.schedule();
         // A callback set while the thread runs waits for the next scheduling.
         if (cycle + 1 < kCycles) harness.setCallback(harness.collector, &refcons[cycle + 1]);
-        harness.push(deviceResetReport(static_cast<std::uint64_t>(cycle)));
+        harness.push(ReportBytes::deviceReset(static_cast<std::uint64_t>(cycle)));
         ASSERT_TRUE(harness.collector.waitFor(static_cast<std::size_t>(cycle) + 1)) << cycle;
         harness.unschedule();
         EXPECT_FALSE(harness.device()->isScheduled()) << cycle;
@@ -42,7 +42,7 @@ TEST(ServiceScheduling, RepeatedCyclesDeliverWithTheCallbackOfTheirScheduling)
     }
 
     // After the last cycle nothing listens: a report is not processed.
-    harness.push(deviceResetReport());
+    harness.push(ReportBytes::deviceReset());
     PropertyValue info = harness.copyProperty("Pipeline.DebugInfo");
     EXPECT_EQ(info.asDictionary().get("ResetCount"), PropertyValue::uint32(kCycles));
     harness.service().close(harness.serviceRef(), 0);
@@ -59,8 +59,8 @@ TEST(ServiceScheduling, DeliveriesQueuedBeforeUnschedulingStillArrive)
     // count shows both, both batches are queued.
     Semaphore::Ref gate = Semaphore::create(0);
     harness.queue()->async([gate] { gate->wait(); });
-    harness.push(deviceResetReport());
-    harness.push(deviceResetReport());
+    harness.push(ReportBytes::deviceReset());
+    harness.push(ReportBytes::deviceReset());
     ASSERT_TRUE(harness.waitForResetCount(2));
     harness.unschedule();
     EXPECT_EQ(harness.collector.events().size(), 0u);
@@ -77,7 +77,7 @@ TEST(ServiceScheduling, EventsWithoutACallbackAreDropped)
     ServiceHarness harness;
     harness.start();
     harness.schedule();  // no callback was ever set
-    harness.push(deviceResetReport());
+    harness.push(ReportBytes::deviceReset());
     ASSERT_TRUE(harness.waitForResetCount(1));
     harness.unschedule();
     harness.queue()->drain();
@@ -85,7 +85,7 @@ TEST(ServiceScheduling, EventsWithoutACallbackAreDropped)
     // The next scheduling with a callback delivers again.
     harness.setCallback(harness.collector);
     harness.schedule();
-    harness.push(deviceResetReport());
+    harness.push(ReportBytes::deviceReset());
     ASSERT_TRUE(harness.collector.waitFor(1));
     harness.unschedule();
     harness.queue()->drain();
@@ -100,7 +100,7 @@ TEST(ServiceScheduling, ALastReleaseWhileScheduledEndsTheThreadFirst)
     {
         ServiceHarness harness;
         harness.bringUp();
-        harness.push(deviceResetReport());
+        harness.push(ReportBytes::deviceReset());
         ASSERT_TRUE(harness.collector.waitFor(1));
         device = harness.device();
         queue = harness.queue();
@@ -109,7 +109,7 @@ TEST(ServiceScheduling, ALastReleaseWhileScheduledEndsTheThreadFirst)
     EXPECT_FALSE(device->isScheduled());
     EXPECT_FALSE(device->hasCallback());
     // Reports that come now are kept by the device, not processed.
-    device->pushInputReport(deviceResetReport());
+    device->pushInputReport(ReportBytes::deviceReset());
     EXPECT_EQ(device->pendingReportCount(), 1u);
     queue->drain();
 }

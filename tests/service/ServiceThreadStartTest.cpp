@@ -71,7 +71,7 @@ TEST(ServiceThreadStart, SchedulingFailsSoftlyAndTheServiceCanBeScheduledLater)
     // Nobody receives reports: the device is neither scheduled nor called.
     EXPECT_FALSE(harness->device()->isScheduled());
     EXPECT_FALSE(harness->device()->hasCallback());
-    harness->push(deviceResetReport());
+    harness->push(ReportBytes::deviceReset());
     EXPECT_EQ(harness->device()->pendingReportCount(), 1u);
 
     ASSERT_TRUE(returns([harness] { harness->unschedule(); })) << "unscheduling waits for a thread that never ran";
