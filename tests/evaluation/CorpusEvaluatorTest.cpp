@@ -33,7 +33,8 @@ std::vector<CorpusEvaluator::Item> examples()
     std::vector<CorpusEvaluator::Item> corpus;
     for (const auto& entry : std::filesystem::directory_iterator(VELTO_EXAMPLES_DIR)) {
         const std::string path = entry.path().string();
-        if (entry.path().extension() != ".json") continue;
+        // Recordings kept for their events alone have no truth beside them.
+        if (entry.path().extension() != ".json" || !std::filesystem::exists(TruthRecord::pathBeside(path))) continue;
         corpus.push_back({path, TruthRecord::parseLines(readAll(TruthRecord::pathBeside(path)))});
     }
     std::sort(corpus.begin(), corpus.end(), [](const auto& a, const auto& b) { return a.recording < b.recording; });
