@@ -1,6 +1,5 @@
 // State keys and gesture counters, read and written through the pipeline's "Algs" domain.
 #include "algs/PipelineHarness.h"
-#include "platform/PropertyDictionary.h"
 
 #include <gtest/gtest.h>
 
@@ -11,7 +10,6 @@
 namespace VeltoTouch::Test {
 namespace {
 
-using VeltoHost::PropertyDictionary;
 using VeltoHost::PropertyValue;
 
 PropertyValue get(PipelineHarness& harness, const std::string& key) { return harness.pipeline.getState("Algs." + key); }
@@ -70,44 +68,6 @@ TEST(AlgsState, EveryKeyOfTheTableReadsAndWritesItsOwnValue)
             }
         }
     }
-}
-
-// Taps and holds counted by kind and by region; suppressed gestures are
-// counted in the end-to-end tests where they are made.
-TEST(AlgsState, CountersOfTapsAndHolds)
-{
-    PipelineHarness harness;
-    const PropertyValue fresh = get(harness, "EventStats");
-    for (const char* group : {"Dispatched", "Rejected"}) {
-        const PropertyDictionary& counters = fresh.asDictionary().get(group).asDictionary();
-        ASSERT_FALSE(counters.empty()) << group;
-        for (const auto& [key, value] : counters) EXPECT_EQ(value, PropertyValue::uint64(0)) << key;
-    }
-
-    harness.idle(3);
-    harness.press({{'G', 400}}, 1);
-    EXPECT_EQ(harness.counter("Dispatched", "numTaps"), 0u);  // the first frame counts nothing
-    harness.press({{'G', 400}}, 4);
-    harness.release();
-    EXPECT_EQ(harness.counter("Dispatched", "numTaps"), 1u);
-    EXPECT_EQ(harness.counter("Dispatched", "numVolumeUp"), 1u);
-
-    // A hold in Bottom lasting 10 frames after its start.
-    harness.idle(100);
-    harness.press({{'M', 300}}, 61);
-    harness.release();
-    EXPECT_EQ(harness.counter("Dispatched", "numBeginHold"), 1u);
-    EXPECT_EQ(harness.counter("Dispatched", "numIncrementHold"), 9u);
-    EXPECT_EQ(harness.counter("Dispatched", "numVolumeDecrement"), 10u);
-    EXPECT_EQ(harness.counter("Dispatched", "numEndHold"), 1u);
-    EXPECT_EQ(harness.counter("Dispatched", "numOvriCall"), 0u);
-    EXPECT_EQ(harness.counter("Rejected", "numRejectedTap"), 0u);
-
-    const PropertyValue stats = get(harness, "EventStats");
-    EXPECT_EQ(get(harness, "DebugInfo").asDictionary().get("EventStats"), stats);
-    harness.setState("ResetEventStats", PropertyValue::null());
-    EXPECT_EQ(get(harness, "EventStats"), fresh);
-    EXPECT_TRUE(get(harness, "ResetEventStats").isNull());
 }
 
 }  // namespace

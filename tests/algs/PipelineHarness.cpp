@@ -1,7 +1,5 @@
 #include "algs/PipelineHarness.h"
 
-#include "platform/PropertyDictionary.h"
-
 namespace VeltoTouch::Test {
 
 PipelineHarness::PipelineHarness(std::uint32_t startTimeMs) : _timeMs(startTimeMs) {}
@@ -18,11 +16,6 @@ void PipelineHarness::press(const Contact& contact, int frameCount)
         pipeline.setTime(++_ticks);
         pipeline.handleInputReport(report.data(), report.size());
     }
-}
-
-std::uint64_t PipelineHarness::counter(const char* group, const char* name)
-{
-    return pipeline.getState("Algs.EventStats").asDictionary().get(group).asDictionary().get(name).toUInt64();
 }
 
 }  // namespace VeltoTouch::Test

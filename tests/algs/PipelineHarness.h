@@ -26,8 +26,6 @@ public:
     void release() { idle(1); }
     void setState(const std::string& key, VeltoHost::PropertyValue value) { pipeline.setState("Algs." + key, value); }
 
-    // One gesture counter of "Algs.EventStats", e.g. counter("Dispatched", "numTaps").
-    std::uint64_t counter(const char* group, const char* name);
     const Algs& algs() const { return pipeline.algs(); }
 
     Pipeline pipeline;
