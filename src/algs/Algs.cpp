@@ -253,16 +253,6 @@ const Algs::StateKey* Algs::stateKeyFor(const std::string& key, std::size_t& ind
 
 const std::array<Algs::StateKey, Algs::kStateKeyCount>& Algs::stateKeys() noexcept { return kStateKeys; }
 
-std::string Algs::touchStateDescription(const Readings& readings, unsigned int timeMs) const
-{
-    return DecisionDump::touchStateDescription(decisionRecord(readings, 0, timeMs, nullptr, eventStats));
-}
-
-std::string Algs::virtualStateDescription(const Readings& readings, unsigned int timeMs) const
-{
-    return DecisionDump::virtualStateDescription(decisionRecord(readings, 0, timeMs, nullptr, eventStats));
-}
-
 // The phase of the touch in this frame; the first row that holds decides.
 std::pair<TouchPhase, std::int32_t> Algs::touchPhase(unsigned int timeMs) const
 {

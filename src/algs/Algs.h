@@ -63,9 +63,6 @@ public:
     static constexpr std::size_t kStateKeyCount = 8;
     static const std::array<StateKey, kStateKeyCount>& stateKeys() noexcept;
 
-    std::string touchStateDescription(const Readings& readings, unsigned int timeMs) const;
-    std::string virtualStateDescription(const Readings& readings, unsigned int timeMs) const;
-
     // One row of the event decision. Every frame the first row whose
     // condition holds for the hand statistics (and the phase of the last
     // event) decides: the event it creates, in the touch's active region, and

@@ -1,5 +1,5 @@
 // State keys and gesture counters, read and written through the pipeline's "Algs" domain.
-#include "algs/PipelineHarness.h"
+#include "pipeline/Pipeline.h"
 
 #include <gtest/gtest.h>
 
@@ -12,27 +12,28 @@ namespace {
 
 using VeltoHost::PropertyValue;
 
-PropertyValue get(PipelineHarness& harness, const std::string& key) { return harness.pipeline.getState("Algs." + key); }
+PropertyValue get(Pipeline& pipeline, const std::string& key) { return pipeline.getState("Algs." + key); }
+void set(Pipeline& pipeline, const std::string& key, PropertyValue value) { pipeline.setState("Algs." + key, value); }
 
 TEST(AlgsState, NormalizationFactorsByIndex)
 {
-    PipelineHarness harness;
+    Pipeline pipeline;
     const std::string domain = "VirtualNormalizationFactors";
-    EXPECT_EQ(get(harness, domain + ".7"), PropertyValue::float32(0.4651f));
-    EXPECT_EQ(get(harness, domain + ".7abc"), PropertyValue::float32(0.4651f));
-    EXPECT_EQ(get(harness, domain + ". 22"), PropertyValue::float32(0.6667f));
-    EXPECT_EQ(get(harness, domain + ".x"), PropertyValue::float32(0.6667f));
-    EXPECT_EQ(get(harness, domain + "."), PropertyValue::float32(0.6667f));
-    EXPECT_TRUE(get(harness, domain + ".23").isNull());
-    EXPECT_TRUE(get(harness, domain).isNull());
+    EXPECT_EQ(get(pipeline, domain + ".7"), PropertyValue::float32(0.4651f));
+    EXPECT_EQ(get(pipeline, domain + ".7abc"), PropertyValue::float32(0.4651f));
+    EXPECT_EQ(get(pipeline, domain + ". 22"), PropertyValue::float32(0.6667f));
+    EXPECT_EQ(get(pipeline, domain + ".x"), PropertyValue::float32(0.6667f));
+    EXPECT_EQ(get(pipeline, domain + "."), PropertyValue::float32(0.6667f));
+    EXPECT_TRUE(get(pipeline, domain + ".23").isNull());
+    EXPECT_TRUE(get(pipeline, domain).isNull());
 
-    harness.setState(domain + ".7", PropertyValue::float64(0.5));
-    EXPECT_EQ(get(harness, domain + ".7"), PropertyValue::float32(0.5f));
+    set(pipeline, domain + ".7", PropertyValue::float64(0.5));
+    EXPECT_EQ(get(pipeline, domain + ".7"), PropertyValue::float32(0.5f));
     // The table changes; the group's virtual pixel keeps the gain it was built with.
-    EXPECT_EQ(harness.algs().virtualPixels[7].gain, 0.4651f);
-    harness.setState(domain + ".99", PropertyValue::float64(0.5));
-    harness.setState(domain, PropertyValue::float64(0.5));
-    EXPECT_EQ(get(harness, domain + ".0"), PropertyValue::float32(0.6667f));
+    EXPECT_EQ(pipeline.algs().virtualPixels[7].gain, 0.4651f);
+    set(pipeline, domain + ".99", PropertyValue::float64(0.5));
+    set(pipeline, domain, PropertyValue::float64(0.5));
+    EXPECT_EQ(get(pipeline, domain + ".0"), PropertyValue::float32(0.6667f));
 }
 
 // Every key of the table is reached by its name only (an indexed one with
@@ -44,27 +45,27 @@ TEST(AlgsState, EveryKeyOfTheTableReadsAndWritesItsOwnValue)
         SCOPED_TRACE(key.name);
         std::string name = key.name;
         if (key.indexed) name.replace(name.rfind(".N"), 2, ".7");
-        PipelineHarness harness;
+        Pipeline pipeline;
         std::map<std::string, PropertyValue> before;
-        for (const Algs::StateKey& other : Algs::stateKeys()) before[other.name] = get(harness, other.name);
+        for (const Algs::StateKey& other : Algs::stateKeys()) before[other.name] = get(pipeline, other.name);
 
-        EXPECT_EQ(get(harness, name).isNull(), key.get == nullptr);
+        EXPECT_EQ(get(pipeline, name).isNull(), key.get == nullptr);
         std::string lower = name;
         for (char& c : lower) c = static_cast<char>(std::tolower(static_cast<unsigned char>(c)));
-        EXPECT_TRUE(get(harness, lower).isNull());
+        EXPECT_TRUE(get(pipeline, lower).isNull());
 
-        harness.setState(name, PropertyValue::string("300"));
-        const PropertyValue written = get(harness, name);
+        set(pipeline, name, PropertyValue::string("300"));
+        const PropertyValue written = get(pipeline, name);
         if (key.set && key.get) {
             EXPECT_EQ(written.toFloat(), 0.0f) << "a string counts as 0";
-            harness.setState(name, PropertyValue::float64(7.0));
-            EXPECT_EQ(get(harness, name).toFloat(), std::string(key.type) == "boolean" ? 1.0f : 7.0f);
+            set(pipeline, name, PropertyValue::float64(7.0));
+            EXPECT_EQ(get(pipeline, name).toFloat(), std::string(key.type) == "boolean" ? 1.0f : 7.0f);
         } else if (key.get) {
             EXPECT_EQ(written, before[key.name]) << "read-only";
         }
         for (const Algs::StateKey& other : Algs::stateKeys()) {
             if (&other != &key && !other.indexed && std::string(other.type) != "dictionary") {
-                EXPECT_EQ(get(harness, other.name), before[other.name]) << "moved by " << name << ": " << other.name;
+                EXPECT_EQ(get(pipeline, other.name), before[other.name]) << "moved by " << name << ": " << other.name;
             }
         }
     }
