@@ -1,10 +1,8 @@
-#include "service/VeltoHIDService.h"
+#include "platform/VeltoHIDService.h"
 
-#include "service/VeltoIUnknown.h"
+#include "platform/VeltoIUnknown.h"
 
-namespace VeltoTouch {
-
-using namespace VeltoHost;
+namespace VeltoHost {
 
 VeltoHIDService::VeltoHIDService()
     : _pluginInterface(new PluginInterfaceTable{
@@ -84,4 +82,4 @@ HidEventRef VeltoHIDService::copyEventWithType(std::uint32_t, HidEvent*, std::ui
 
 VeltoStatus VeltoHIDService::setOutputEvent(HidEvent*) { return kVeltoUnsupported; }
 
-}  // namespace VeltoTouch
+}  // namespace VeltoHost

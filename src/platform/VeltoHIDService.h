@@ -7,7 +7,7 @@
 #include <atomic>
 #include <cstdint>
 
-namespace VeltoTouch {
+namespace VeltoHost {
 
 // Base of a HID service plug-in object: owns the two function tables through
 // which the host talks to it and the object's reference count. The host holds
@@ -24,8 +24,8 @@ public:
     VeltoHIDService(const VeltoHIDService&) = delete;
     VeltoHIDService& operator=(const VeltoHIDService&) = delete;
 
-    VeltoHost::VeltoInterfaceRef getPluginInterface() noexcept;
-    VeltoHost::VeltoInterfaceRef getServiceInterface() noexcept;
+    VeltoInterfaceRef getPluginInterface() noexcept;
+    VeltoInterfaceRef getServiceInterface() noexcept;
 
     // Reference counting shared by both interfaces. A new object holds one
     // reference, its creator's. Both return the count after the change;
@@ -33,28 +33,28 @@ public:
     std::uint32_t addRef() noexcept;
     std::uint32_t release() noexcept;
 
-    virtual VeltoHost::VeltoStatus probeWithService(std::uint32_t service, const VeltoHost::PropertyValue& properties,
+    virtual VeltoStatus probeWithService(std::uint32_t service, const PropertyValue& properties,
                                                     std::int32_t* outScore);
-    virtual VeltoHost::VeltoStatus startWithService(std::uint32_t service, const VeltoHost::PropertyValue& properties);
-    virtual VeltoHost::VeltoStatus stop();
+    virtual VeltoStatus startWithService(std::uint32_t service, const PropertyValue& properties);
+    virtual VeltoStatus stop();
     virtual bool openWithOptions(std::uint32_t options);
     virtual void closeWithOptions(std::uint32_t options);
     // An empty reference stands for null. `key` may be null.
-    virtual VeltoHost::PropertyValue getPropertyForKey(const char* key);
-    virtual bool setProperty(const VeltoHost::PropertyValue& value, const char* key);
-    virtual void setEventCallback(VeltoHost::VeltoEventCallback callback, void* target, void* refcon);
-    virtual void scheduleWithDispatchQueue(const VeltoHost::SerialQueue::Ref& queue);
-    virtual void unscheduleWithDispatchQueue(const VeltoHost::SerialQueue::Ref& queue);
-    virtual VeltoHost::HidEventRef copyEventWithType(std::uint32_t type, VeltoHost::HidEvent* matching,
+    virtual PropertyValue getPropertyForKey(const char* key);
+    virtual bool setProperty(const PropertyValue& value, const char* key);
+    virtual void setEventCallback(VeltoEventCallback callback, void* target, void* refcon);
+    virtual void scheduleWithDispatchQueue(const SerialQueue::Ref& queue);
+    virtual void unscheduleWithDispatchQueue(const SerialQueue::Ref& queue);
+    virtual HidEventRef copyEventWithType(std::uint32_t type, HidEvent* matching,
                                                      std::uint32_t options);
-    virtual VeltoHost::VeltoStatus setOutputEvent(VeltoHost::HidEvent* event);
+    virtual VeltoStatus setOutputEvent(HidEvent* event);
 
 private:
     // The host dereferences these members' addresses, so they stay plain
     // pointers to tables that never move.
-    VeltoHost::PluginInterfaceTable* _pluginInterface;
-    VeltoHost::ServiceInterfaceTable* _serviceInterface;
+    PluginInterfaceTable* _pluginInterface;
+    ServiceInterfaceTable* _serviceInterface;
     std::atomic<std::uint32_t> _refCount{1};
 };
 
-}  // namespace VeltoTouch
+}  // namespace VeltoHost

@@ -1,11 +1,9 @@
-#include "service/VeltoIUnknown.h"
+#include "platform/VeltoIUnknown.h"
 
 #include "platform/SerialQueue.h"
-#include "service/VeltoHIDService.h"
+#include "platform/VeltoHIDService.h"
 
-namespace VeltoTouch {
-
-using namespace VeltoHost;
+namespace VeltoHost {
 
 namespace {
 
@@ -140,4 +138,4 @@ VeltoStatus VeltoIUnknown::setOutputEvent(VeltoInterfaceRef self, HidEvent* even
     return hold->setOutputEvent(event);
 }
 
-}  // namespace VeltoTouch
+}  // namespace VeltoHost

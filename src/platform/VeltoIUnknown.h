@@ -4,7 +4,7 @@
 
 #include <cstdint>
 
-namespace VeltoTouch {
+namespace VeltoHost {
 
 // The functions that sit in the plug-in and service tables. Each takes the
 // host's interface pointer, finds the service object through the table's
@@ -15,28 +15,28 @@ class VeltoIUnknown {
 public:
     VeltoIUnknown() = delete;
 
-    static VeltoHost::VeltoStatus QueryInterface(VeltoHost::VeltoInterfaceRef self, VeltoHost::VeltoUUID iid,
-                                                 VeltoHost::VeltoInterfaceRef* out);
-    static std::uint32_t AddRef(VeltoHost::VeltoInterfaceRef self);
-    static std::uint32_t Release(VeltoHost::VeltoInterfaceRef self);
+    static VeltoStatus QueryInterface(VeltoInterfaceRef self, VeltoUUID iid,
+                                                 VeltoInterfaceRef* out);
+    static std::uint32_t AddRef(VeltoInterfaceRef self);
+    static std::uint32_t Release(VeltoInterfaceRef self);
 
-    static VeltoHost::VeltoStatus Probe(VeltoHost::VeltoInterfaceRef self, const VeltoHost::PropertyValue& properties,
+    static VeltoStatus Probe(VeltoInterfaceRef self, const PropertyValue& properties,
                                         std::uint32_t service, std::int32_t* outScore);
-    static VeltoHost::VeltoStatus Start(VeltoHost::VeltoInterfaceRef self, const VeltoHost::PropertyValue& properties,
+    static VeltoStatus Start(VeltoInterfaceRef self, const PropertyValue& properties,
                                         std::uint32_t service);
-    static VeltoHost::VeltoStatus Stop(VeltoHost::VeltoInterfaceRef self);
+    static VeltoStatus Stop(VeltoInterfaceRef self);
 
-    static bool open(VeltoHost::VeltoInterfaceRef self, std::uint32_t options);
-    static void close(VeltoHost::VeltoInterfaceRef self, std::uint32_t options);
-    static VeltoHost::PropertyValue copyProperty(VeltoHost::VeltoInterfaceRef self, const char* key);
-    static bool setProperty(VeltoHost::VeltoInterfaceRef self, const char* key, const VeltoHost::PropertyValue& value);
-    static void setEventCallback(VeltoHost::VeltoInterfaceRef self, VeltoHost::VeltoEventCallback callback,
+    static bool open(VeltoInterfaceRef self, std::uint32_t options);
+    static void close(VeltoInterfaceRef self, std::uint32_t options);
+    static PropertyValue copyProperty(VeltoInterfaceRef self, const char* key);
+    static bool setProperty(VeltoInterfaceRef self, const char* key, const PropertyValue& value);
+    static void setEventCallback(VeltoInterfaceRef self, VeltoEventCallback callback,
                                  void* target, void* refcon);
-    static void scheduleWithDispatchQueue(VeltoHost::VeltoInterfaceRef self, VeltoHost::SerialQueue* queue);
-    static void unscheduleFromDispatchQueue(VeltoHost::VeltoInterfaceRef self, VeltoHost::SerialQueue* queue);
-    static VeltoHost::HidEventRef copyEvent(VeltoHost::VeltoInterfaceRef self, std::uint32_t type,
-                                            VeltoHost::HidEvent* matching, std::uint32_t options);
-    static VeltoHost::VeltoStatus setOutputEvent(VeltoHost::VeltoInterfaceRef self, VeltoHost::HidEvent* event);
+    static void scheduleWithDispatchQueue(VeltoInterfaceRef self, SerialQueue* queue);
+    static void unscheduleFromDispatchQueue(VeltoInterfaceRef self, SerialQueue* queue);
+    static HidEventRef copyEvent(VeltoInterfaceRef self, std::uint32_t type,
+                                            HidEvent* matching, std::uint32_t options);
+    static VeltoStatus setOutputEvent(VeltoInterfaceRef self, HidEvent* event);
 };
 
-}  // namespace VeltoTouch
+}  // namespace VeltoHost

@@ -7,7 +7,7 @@
 #include "platform/InputReportThread.h"
 #include "platform/SerialQueue.h"
 #include "recording/PipelineRecording.h"
-#include "service/VeltoHIDService.h"
+#include "platform/VeltoHIDService.h"
 
 #include <array>
 #include <cstdint>
@@ -26,7 +26,7 @@ namespace VeltoTouch {
 // The host calls the lifecycle, scheduling and property operations from its
 // own thread, one at a time, in its documented order (start before open and
 // schedule, unschedule before stop).
-class VeltoTouchHIDService final : public VeltoHIDService {
+class VeltoTouchHIDService final : public VeltoHost::VeltoHIDService {
 public:
     // Where events go: the host's queue and callback, with the opaque words
     // passed back to it.

@@ -1,8 +1,8 @@
 // A test plug-in: the smallest HID service that exercises the host side for
-// real. It implements both tables, takes its device from the service handle,
+// real. Built on the platform's service base, it takes its device from the service handle,
 // runs an input-report thread with its own event loop, and turns every input
 // report into a vendor-defined event (payload = the report bytes) delivered
-// on the host's queue. Every table call is written to a call log that the
+// on the host's queue. Every operation is written to a call log that the
 // tests read through the exported VeltoEchoCallLog.
 
 #include "platform/HidEvent.h"
@@ -12,7 +12,7 @@
 #include "platform/RunLoop.h"
 #include "platform/InputReportThread.h"
 #include "platform/SerialQueue.h"
-#include "platform/Thread.h"
+#include "platform/VeltoHIDService.h"
 
 #include <atomic>
 #include <mutex>
@@ -45,122 +45,80 @@ struct DispatchInfo {
     void* sender = nullptr;
 };
 
-class EchoService {
+class EchoService final : public VeltoHIDService {
 public:
-    explicit EchoService(bool serveServiceInterface) : _serveServiceInterface(serveServiceInterface)
+    EchoService()
     {
         ++liveServices;
         logCall("create");
     }
-    ~EchoService()
+    ~EchoService() override
     {
         logCall("dealloc");
         --liveServices;
     }
 
-    VeltoInterfaceRef pluginInterface() { return &_pluginInterface; }
-
-private:
-    static EchoService& from(VeltoInterfaceRef self)
-    {
-        return *static_cast<EchoService*>((*static_cast<void***>(self))[0]);
-    }
-
-    static VeltoStatus queryInterface(VeltoInterfaceRef self, VeltoUUID iid, VeltoInterfaceRef* out)
-    {
-        EchoService& service = from(self);
-        logCall("QueryInterface");
-        if (iid == kVeltoPluginInterfaceID) {
-            *out = &service._pluginInterface;
-        } else if (iid == kVeltoHIDServiceInterface2ID && service._serveServiceInterface) {
-            *out = &service._serviceInterface;
-        } else {
-            return kVeltoNoInterface;
-        }
-        ++service._references;
-        return kVeltoSuccess;
-    }
-    static std::uint32_t addRef(VeltoInterfaceRef self)
-    {
-        logCall("AddRef");
-        return ++from(self)._references;
-    }
-    static std::uint32_t release(VeltoInterfaceRef self)
-    {
-        EchoService* service = &from(self);
-        logCall("Release");
-        std::uint32_t count = --service->_references;
-        if (count == 0) delete service;
-        return count;
-    }
-    static VeltoStatus probe(VeltoInterfaceRef, const PropertyValue& properties, std::uint32_t, std::int32_t*)
+    VeltoStatus probeWithService(std::uint32_t, const PropertyValue& properties, std::int32_t*) override
     {
         logCall("Probe " + properties.description());
         return kVeltoSuccess;
     }
-    static VeltoStatus start(VeltoInterfaceRef self, const PropertyValue&, std::uint32_t service)
+    VeltoStatus startWithService(std::uint32_t service, const PropertyValue&) override
     {
         logCall("Start");
-        from(self)._device = HostDevice::createWithService(service);
-        return from(self)._device ? kVeltoSuccess : kVeltoNoResources;
+        _device = HostDevice::createWithService(service);
+        return _device ? kVeltoSuccess : kVeltoNoResources;
     }
-    static VeltoStatus stop(VeltoInterfaceRef self)
+    VeltoStatus stop() override
     {
         logCall("Stop");
-        from(self)._device.reset();
+        _device.reset();
         return kVeltoSuccess;
     }
-    static bool open(VeltoInterfaceRef self, std::uint32_t options)
+    bool openWithOptions(std::uint32_t options) override
     {
         logCall("open");
-        return from(self)._device && from(self)._device->open(options);
+        return _device && _device->open(options);
     }
-    static void close(VeltoInterfaceRef self, std::uint32_t options)
+    void closeWithOptions(std::uint32_t options) override
     {
         logCall("close");
-        if (from(self)._device) from(self)._device->close(options);
+        if (_device) _device->close(options);
     }
     // Properties are the device's.
-    static PropertyValue copyProperty(VeltoInterfaceRef self, const char* key)
+    PropertyValue getPropertyForKey(const char* key) override
     {
-        return key && from(self)._device ? from(self)._device->getProperty(key) : PropertyValue();
+        return key && _device ? _device->getProperty(key) : PropertyValue();
     }
-    static bool setProperty(VeltoInterfaceRef self, const char* key, const PropertyValue& value)
+    bool setProperty(const PropertyValue& value, const char* key) override
     {
-        return key && from(self)._device && from(self)._device->setProperty(key, value);
+        return key && _device && _device->setProperty(key, value);
     }
-    static void setEventCallback(VeltoInterfaceRef self, VeltoEventCallback callback, void* target, void* refcon)
+    void setEventCallback(VeltoEventCallback callback, void* target, void* refcon) override
     {
         logCall("setEventCallback");
-        DispatchInfo& dispatch = from(self)._dispatch;
-        dispatch.callback = callback;
-        dispatch.target = target;
-        dispatch.refcon = refcon;
+        _dispatch.callback = callback;
+        _dispatch.target = target;
+        _dispatch.refcon = refcon;
     }
-    static void schedule(VeltoInterfaceRef self, SerialQueue* queue)
+    void scheduleWithDispatchQueue(const SerialQueue::Ref& queue) override
     {
         logCall("scheduleWithDispatchQueue");
-        EchoService* service = &from(self);
-        service->_dispatch.queue = queue ? queue->shared_from_this() : nullptr;
-        service->_dispatch.sender = &service->_serviceInterface;
-        service->_thread.start("echo.reports", {nullptr,
-                                                [service, info = service->_dispatch]() mutable {
-                                                    // Moved in: the queue reference is gone before the exit signal.
-                                                    service->handleInputReports(std::move(info));
-                                                },
-                                                nullptr});
+        _dispatch.queue = queue;
+        _dispatch.sender = getServiceInterface();
+        // Moved in: the queue reference is gone before the exit signal.
+        _thread.start("echo.reports", {nullptr, [this, info = _dispatch]() mutable { handleInputReports(std::move(info)); },
+                                       nullptr});
     }
-    static void unschedule(VeltoInterfaceRef self, SerialQueue*)
+    void unscheduleWithDispatchQueue(const SerialQueue::Ref&) override
     {
         logCall("unscheduleFromDispatchQueue");
-        EchoService& service = from(self);
-        service._thread.requestStop(kEchoMode);
-        service._thread.waitUntilStopped();
-        service._dispatch.queue.reset();
+        _thread.requestStop(kEchoMode);
+        _thread.waitUntilStopped();
+        _dispatch.queue.reset();
     }
-    static HidEventRef copyEvent(VeltoInterfaceRef, std::uint32_t, HidEvent*, std::uint32_t) { return nullptr; }
-    static VeltoStatus setOutputEvent(VeltoInterfaceRef, HidEvent*) { return kVeltoUnsupported; }
 
+private:
     void handleInputReports(DispatchInfo info)
     {
         std::vector<std::uint8_t> buffer(512);
@@ -181,20 +139,41 @@ private:
         info.queue->async([info, event] { info.callback(info.target, info.refcon, info.sender, event.get(), 0); });
     }
 
-    PluginInterfaceTable _pluginTable{this, &queryInterface, &addRef, &release, 1, 0, &probe, &start, &stop};
-    ServiceInterfaceTable _serviceTable{this, &queryInterface, &addRef, &release, &open, &close, &copyProperty,
-                                        &setProperty, &setEventCallback, &schedule, &unschedule, &copyEvent,
-                                        &setOutputEvent};
-    // The host's interface pointers are these members' addresses.
-    PluginInterfaceTable* _pluginInterface = &_pluginTable;
-    ServiceInterfaceTable* _serviceInterface = &_serviceTable;
-    std::atomic<std::uint32_t> _references{1};
-    const bool _serveServiceInterface;
-
     // Host thread, or the input-report thread between the handshakes.
     HostDevice::Ref _device;
     InputReportThread _thread;
     DispatchInfo _dispatch;
+};
+
+// A plug-in that answers only for its plug-in interface, for the host's
+// error path: the host must refuse it and release it.
+class PluginOnly {
+public:
+    PluginOnly() { ++liveServices; }
+    ~PluginOnly() { --liveServices; }
+    VeltoInterfaceRef pluginInterface() { return &_interface; }
+
+private:
+    static PluginOnly& from(VeltoInterfaceRef self) { return *static_cast<PluginOnly*>((*static_cast<PluginInterfaceTable**>(self))->reserved); }
+    static VeltoStatus query(VeltoInterfaceRef self, VeltoUUID iid, VeltoInterfaceRef* out)
+    {
+        if (iid != kVeltoPluginInterfaceID) return kVeltoNoInterface;
+        *out = self;
+        addRef(self);
+        return kVeltoSuccess;
+    }
+    static std::uint32_t addRef(VeltoInterfaceRef self) { return ++from(self)._references; }
+    static std::uint32_t release(VeltoInterfaceRef self)
+    {
+        PluginOnly* plugin = &from(self);
+        const std::uint32_t count = --plugin->_references;
+        if (count == 0) delete plugin;
+        return count;
+    }
+
+    PluginInterfaceTable _table{this, &query, &addRef, &release, 1, 0, nullptr, nullptr, nullptr};
+    PluginInterfaceTable* _interface = &_table;
+    std::uint32_t _references = 1;
 };
 
 }  // namespace
@@ -202,13 +181,13 @@ private:
 // The creation's reference is the one the host releases.
 VELTO_EXPORT VeltoInterfaceRef VeltoEchoServiceFactory(void*, VeltoUUID typeID)
 {
-    return typeID == kVeltoHIDServicePluginTypeID ? (new EchoService(true))->pluginInterface() : nullptr;
+    return typeID == kVeltoHIDServicePluginTypeID ? (new EchoService)->getPluginInterface() : nullptr;
 }
 
 // A plug-in that serves only the plug-in interface, for the host's error path.
 VELTO_EXPORT VeltoInterfaceRef VeltoEchoPluginOnlyFactory(void*, VeltoUUID typeID)
 {
-    return typeID == kVeltoHIDServicePluginTypeID ? (new EchoService(false))->pluginInterface() : nullptr;
+    return typeID == kVeltoHIDServicePluginTypeID ? (new PluginOnly)->pluginInterface() : nullptr;
 }
 
 VELTO_EXPORT int VeltoEchoLiveServices()
