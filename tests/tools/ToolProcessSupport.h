@@ -19,13 +19,19 @@
 
 namespace VeltoTool::Testing {
 
-// How the process is started: limits, extra environment entries ("NAME=VALUE")
-// and, when not the built tool itself, another copy of it.
+// How the process is started: limits, extra environment entries ("NAME=VALUE"),
+// when not the built tool itself another program, and whether its standard
+// error is the test's own (for a long-lived helper whose messages nobody reads).
 struct ProcessSetup {
     std::optional<rlim_t> addressSpaceBytes;
     std::optional<rlim_t> fileSizeBytes;
     std::vector<std::string> environment;
+    bool sharedStandardError = false;
+#ifdef VELTO_TOOL_PATH
     std::string program = VELTO_TOOL_PATH;
+#else
+    std::string program;
+#endif
 
     // One field each, without naming the others (GCC warns of a designated
     // initializer that leaves members out).
@@ -66,7 +72,7 @@ public:
     explicit ToolProcess(const std::vector<std::string>& arguments, ProcessSetup limits = {})
     {
         int outPipe[2], errPipe[2];
-        if (::pipe(outPipe) != 0 || ::pipe(errPipe) != 0) return;
+        if (::pipe2(outPipe, O_CLOEXEC) != 0 || ::pipe2(errPipe, O_CLOEXEC) != 0) return;
         std::vector<std::string> argv{limits.program};
         argv.insert(argv.end(), arguments.begin(), arguments.end());
         std::vector<char*> pointers;
@@ -76,9 +82,7 @@ public:
         _pid = ::fork();
         if (_pid == 0) {
             ::dup2(outPipe[1], STDOUT_FILENO);
-            ::dup2(errPipe[1], STDERR_FILENO);
-            ::close(outPipe[0]);
-            ::close(errPipe[0]);
+            if (!limits.sharedStandardError) ::dup2(errPipe[1], STDERR_FILENO);
             // A shell without job control starts background jobs with SIGINT
             // ignored, and that would carry over to the tool.
             ::signal(SIGINT, SIG_DFL);
@@ -193,19 +197,5 @@ private:
     std::string _outText;
     std::string _errText;
 };
-
-// Address-space limits cannot work under the sanitizers, which reserve
-// terabytes of shadow memory up front.
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-constexpr bool kAddressSpaceLimitsWork = false;
-#elif defined(__has_feature)
-#if __has_feature(address_sanitizer) || __has_feature(thread_sanitizer)
-constexpr bool kAddressSpaceLimitsWork = false;
-#else
-constexpr bool kAddressSpaceLimitsWork = true;
-#endif
-#else
-constexpr bool kAddressSpaceLimitsWork = true;
-#endif
 
 }  // namespace VeltoTool::Testing

@@ -1,25 +1,20 @@
 #include "PrivateBus.h"
 
-#include <fcntl.h>
-#include <poll.h>
-#include <signal.h>
-#include <spawn.h>
+#include "tools/ToolProcessSupport.h"
+
 #include <sys/stat.h>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <vector>
 
-extern char** environ;
+using VeltoTool::Testing::ProcessSetup;
+using VeltoTool::Testing::ToolProcess;
 
 namespace {
 
-// Starting the daemon takes milliseconds; this only bounds a broken start.
-constexpr int kStartTimeoutMs = 10'000;
+constexpr const char* kDaemon = "/usr/bin/dbus-daemon";
 
 // A default policy: `ownAndCall` says who may own names and call methods;
 // replies, signals and receiving are open on every bus of these tests.
@@ -85,57 +80,27 @@ PrivateBus::PrivateBus(const std::string& policy, const std::string& type, const
         _error = "cannot write " + configPath;
         return;
     }
-    start(configPath);
-}
-
-void PrivateBus::start(const std::string& configPath)
-{
-    int output[2];
-    if (::pipe2(output, O_CLOEXEC) != 0) {
-        _error = std::string("pipe: ") + std::strerror(errno);
+    if (::access(kDaemon, X_OK) != 0) {
+        _error = std::string("cannot start ") + kDaemon + " (package dbus): " + std::strerror(errno);
         return;
     }
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_adddup2(&actions, output[1], STDOUT_FILENO);
-    const std::string configArgument = "--config-file=" + configPath;
-    std::vector<char*> argv = {const_cast<char*>("dbus-daemon"), const_cast<char*>(configArgument.c_str()),
-                               const_cast<char*>("--print-address"), const_cast<char*>("--nofork"),
-                               const_cast<char*>("--nosyslog"), nullptr};
-    const int spawned = ::posix_spawnp(&_pid, "dbus-daemon", &actions, nullptr, argv.data(), environ);
-    posix_spawn_file_actions_destroy(&actions);
-    ::close(output[1]);
-    if (spawned != 0) {
-        _pid = -1;
-        ::close(output[0]);
-        _error = std::string("cannot start dbus-daemon (package dbus): ") + std::strerror(spawned);
-        return;
-    }
-
-    std::string line;
-    pollfd readable{output[0], POLLIN, 0};
-    while (line.find('\n') == std::string::npos && ::poll(&readable, 1, kStartTimeoutMs) > 0) {
-        char chunk[256];
-        const ssize_t count = ::read(output[0], chunk, sizeof chunk);
-        if (count <= 0) break;
-        line.append(chunk, static_cast<std::size_t>(count));
-    }
-    ::close(output[0]);
-    const std::size_t end = line.find('\n');
-    if (end == std::string::npos) {
+    ProcessSetup setup = ProcessSetup::copy(kDaemon);
+    setup.sharedStandardError = true;
+    _daemon = std::make_unique<ToolProcess>(
+        std::vector<std::string>{"--config-file=" + configPath, "--print-address", "--nofork", "--nosyslog"}, setup);
+    // Starting takes milliseconds; the limit only bounds a broken start.
+    if (auto address = _daemon->readLine(ToolProcess::Seconds(10))) {
+        _address = *address;
+    } else {
         _error = "dbus-daemon printed no address (see its messages above)";
-        return;
     }
-    _address = line.substr(0, end);
 }
 
 PrivateBus::~PrivateBus()
 {
-    if (_pid > 0) {
-        ::kill(_pid, SIGTERM);
-        int status = 0;
-        while (::waitpid(_pid, &status, 0) < 0 && errno == EINTR) {
-        }
+    if (_daemon) {
+        _daemon->signal(SIGTERM);
+        _daemon->finish(ToolProcess::Seconds(10));
     }
     if (!_directory.empty()) {
         std::error_code ignored;

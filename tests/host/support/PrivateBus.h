@@ -1,8 +1,11 @@
 #pragma once
 
-#include <sys/types.h>
-
+#include <memory>
 #include <string>
+
+namespace VeltoTool::Testing {
+class ToolProcess;
+}
 
 // A dbus-daemon of a test's own, listening on a socket in a fresh temporary
 // directory and stopped with the object, so that bus tests need no system or
@@ -29,10 +32,8 @@ public:
     const std::string& directory() const { return _directory; }
 
 private:
-    void start(const std::string& configPath);
-
     std::string _directory;
     std::string _address;
     std::string _error;
-    pid_t _pid = -1;
+    std::unique_ptr<VeltoTool::Testing::ToolProcess> _daemon;
 };
