@@ -1,6 +1,6 @@
 // The service driven through its tables with a simulated device and a serial
 // queue: reports in, events out at the host's callback, one delivery job per
-// report, and the log lines of one whole cycle.
+// report, and the order of one whole cycle as its log shows it.
 
 #include "records/TickConversion.h"
 #include "platform/CaptureLogSink.h"
@@ -48,17 +48,6 @@ private:
     Trace::Observer _previous;
 };
 
-LogLevel expectedLevel(const std::string& message)
-{
-    for (const char* prefix : {"Received image frame", "Firmware event probe", "Dispatch event: "}) {
-        if (message.rfind(prefix, 0) == 0) return LogLevel::Default;
-    }
-    if (message.rfind("Disjoint image", 0) == 0 || message.rfind("pthread_setschedparam failed: ", 0) == 0) {
-        return LogLevel::Error;
-    }
-    return LogLevel::Debug;
-}
-
 }  // namespace
 
 TEST(ServiceCycle, ACycleDeliversOnTheQueueAndLogsItsStepsInOrder)
@@ -90,11 +79,6 @@ TEST(ServiceCycle, ACycleDeliversOnTheQueueAndLogsItsStepsInOrder)
         EXPECT_TRUE(events[0].onQueue);
     }
 
-    for (const LogRecord& record : capture.sink().records()) {
-        if (record.category != "HIDService") continue;
-        EXPECT_EQ(record.subsystem.substr(record.subsystem.size() - 15), ".hid.VeltoTouch");
-        EXPECT_EQ(record.level, expectedLevel(record.message)) << record.message;
-    }
     // The operations and the thread's handshake in order, with the bad
     // reports and the frame gap named on the way.
     const std::vector<std::string> all = capture.sink().messages("HIDService");
