@@ -12,35 +12,24 @@ HostDeviceRegistry& HostDeviceRegistry::shared()
 
 std::uint32_t HostDeviceRegistry::add(HostDevice::Ref device)
 {
-    return addFactory([device = std::move(device)] { return device; });
-}
-
-std::uint32_t HostDeviceRegistry::addFactory(Factory factory)
-{
     std::lock_guard<std::mutex> guard(_lock);
     // Skip handles chosen by set() and the null handle after a wrap.
     while (_nextService == 0 || _entries.count(_nextService) != 0) ++_nextService;
     std::uint32_t service = _nextService++;
-    _entries[service] = std::move(factory);
+    _entries[service] = std::move(device);
     return service;
 }
 
 void HostDeviceRegistry::set(std::uint32_t service, HostDevice::Ref device)
 {
-    setFactory(service, [device = std::move(device)] { return device; });
-}
-
-void HostDeviceRegistry::setFactory(std::uint32_t service, Factory factory)
-{
-    Factory previous;
+    HostDevice::Ref previous;  // released after the lock: it may be the last reference
     std::lock_guard<std::mutex> guard(_lock);
-    Factory& entry = _entries[service];
-    previous = std::exchange(entry, std::move(factory));
+    previous = std::exchange(_entries[service], std::move(device));
 }
 
 void HostDeviceRegistry::remove(std::uint32_t service)
 {
-    Factory removed;  // released after the lock, it may hold the last device reference
+    HostDevice::Ref removed;  // released after the lock: it may be the last reference
     std::lock_guard<std::mutex> guard(_lock);
     auto it = _entries.find(service);
     if (it == _entries.end()) return;
@@ -50,14 +39,9 @@ void HostDeviceRegistry::remove(std::uint32_t service)
 
 HostDevice::Ref HostDeviceRegistry::deviceForService(std::uint32_t service) const
 {
-    Factory factory;
-    {
-        std::lock_guard<std::mutex> guard(_lock);
-        auto it = _entries.find(service);
-        if (it == _entries.end() || !it->second) return nullptr;
-        factory = it->second;
-    }
-    return factory();
+    std::lock_guard<std::mutex> guard(_lock);
+    auto it = _entries.find(service);
+    return it == _entries.end() ? nullptr : it->second;
 }
 
 }  // namespace VeltoHost

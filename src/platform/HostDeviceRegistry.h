@@ -3,7 +3,6 @@
 #include "platform/HostDevice.h"
 
 #include <cstdint>
-#include <functional>
 #include <map>
 #include <mutex>
 
@@ -14,28 +13,25 @@ namespace VeltoHost {
 // HostDevice::createWithService looks it up here. Both sides share this one
 // table because the platform library is loaded once per process.
 //
-// Thread-safe: every operation takes the table's lock; factories run outside it.
+// Thread-safe: every operation takes the table's lock; a device that leaves
+// the table is released outside it.
 class HostDeviceRegistry {
 public:
-    using Factory = std::function<HostDevice::Ref()>;
-
     static HostDeviceRegistry& shared();
 
     // Registers under a fresh handle (never 0) and returns it.
     std::uint32_t add(HostDevice::Ref device);
-    std::uint32_t addFactory(Factory factory);
     // Registers under a handle the caller chose, replacing what was there.
     void set(std::uint32_t service, HostDevice::Ref device);
-    void setFactory(std::uint32_t service, Factory factory);
     void remove(std::uint32_t service);
 
-    // The registered device, the factory's device, or null.
+    // The registered device, or null.
     HostDevice::Ref deviceForService(std::uint32_t service) const;
 
 private:
     mutable std::mutex _lock;
     // Guarded by _lock.
-    std::map<std::uint32_t, Factory> _entries;
+    std::map<std::uint32_t, HostDevice::Ref> _entries;
     std::uint32_t _nextService = 1;
 };
 

@@ -47,7 +47,6 @@ std::int32_t SimulatedHostDevice::getReport(HidReportType type, std::uint32_t re
     if (_unplugged) return kHostDeviceNoDevice;
     if (!_open) return kHostDeviceNotOpen;
     if (buffer == nullptr || length == 0) return kHostDeviceBadArgument;
-    if (auto it = _getReportFailureByID.find(reportID); it != _getReportFailureByID.end()) return it->second;
     if (_getReportFailure) return *_getReportFailure;
     auto it = _reports.find({type, reportID});
     if (it == _reports.end()) return kHostDeviceError;
@@ -120,16 +119,6 @@ void SimulatedHostDevice::failGetReport(std::int32_t status)
         _getReportFailure.reset();
     } else {
         _getReportFailure = status;
-    }
-}
-
-void SimulatedHostDevice::failGetReport(std::uint32_t reportID, std::int32_t status)
-{
-    std::lock_guard<std::mutex> guard(_lock);
-    if (status == kHostDeviceSuccess) {
-        _getReportFailureByID.erase(reportID);
-    } else {
-        _getReportFailureByID[reportID] = status;
     }
 }
 

@@ -76,10 +76,9 @@ public:
         setReport(HidReportType::Feature, reportID, std::move(bytes));
     }
 
-    // Failure injection: getReport of every ID, or of one ID, returns
-    // `status` (kHostDeviceSuccess clears it); open fails while failOpen is set.
+    // Failure injection: getReport of every ID returns `status`
+    // (kHostDeviceSuccess clears it); open fails while failOpen is set.
     void failGetReport(std::int32_t status);
-    void failGetReport(std::uint32_t reportID, std::int32_t status);
     void failOpen(bool fail);
     void refusePropertyWrites(bool refuse);
     // The device goes away: delivery ends, pending reports are dropped and
@@ -122,7 +121,6 @@ private:
     bool _failOpen = false;
     bool _refusePropertyWrites = false;
     std::optional<std::int32_t> _getReportFailure;
-    std::map<std::uint32_t, std::int32_t> _getReportFailureByID;
     std::map<std::pair<HidReportType, std::uint32_t>, std::vector<std::uint8_t>> _reports;
     std::map<std::string, PropertyValue> _properties;
     std::deque<PendingReport> _pending;

@@ -41,9 +41,11 @@ TEST(PluginLocatorTest, LooksInTheEnvironmentThenBesideTheProgramThenTheBuildThe
     touch(besideProgram);
     EXPECT_EQ(PluginLocator::find("", program, buildTree, installed).path, besideProgram);
 
-    // The environment's choice comes first (that it is final when missing is
-    // checked through a copied tool).
+    // The environment's choice comes first, and is final when it is missing.
     const std::string chosen = (root / "chosen.so").string();
+    const PluginLocator::Result missing = PluginLocator::find(chosen, program, buildTree, installed);
+    EXPECT_EQ(missing.path, "");
+    EXPECT_EQ(missing.tried, std::vector<std::string>{chosen + " (VELTOTOUCH_PLUGIN)"});
     touch(chosen);
     EXPECT_EQ(PluginLocator::find(chosen, program, buildTree, installed).path, chosen);
     fs::remove_all(root);

@@ -179,28 +179,6 @@ TEST(HostCommandTest, WhatCannotWorkIsRefusedBeforeTheFirstReport)
     EXPECT_EQ(noPlugin.err.rfind("veltotouch: cannot load plug-in module /nonexistent/plugin.so: ", 0), 0u) << noPlugin.err;
 }
 
-TEST(HostCommandTest, ACopiedToolFindsItsModuleOrSaysWhereItLooked)
-{
-    TempDir dir;
-    const fs::path copy = dir.path() / "veltotouch";
-    fs::copy_file(VELTO_TOOL_PATH, copy);
-    fs::permissions(copy, fs::perms::owner_all);
-    const std::vector<std::string> arguments{"host", "--device", "sim:" + kExamples + "/taps.json", "--speed", "0"};
-
-    ToolProcess copied(arguments, ProcessSetup::copy(copy.string()));
-    ASSERT_TRUE(copied.started());
-    const ToolProcess::Result found = copied.finish(ToolProcess::Seconds(20));
-    EXPECT_EQ(found.status, 0) << found.err;
-    EXPECT_NE(found.out.find("tap"), std::string::npos);
-
-    ToolProcess misdirected(arguments, ProcessSetup::copy(copy.string(), {"VELTOTOUCH_PLUGIN=/nonexistent/module.so"}));
-    const ToolProcess::Result missing = misdirected.finish(ToolProcess::Seconds(20));
-    EXPECT_EQ(missing.status, 1);
-    EXPECT_EQ(missing.err,
-              "veltotouch: plug-in module not found; looked in /nonexistent/module.so (VELTOTOUCH_PLUGIN) (give "
-              "--plugin PATH or set VELTOTOUCH_PLUGIN)\n");
-}
-
 TEST(HostCommandTest, ASettingThePlugInConvertsIsWarnedOfAndStillWritten)
 {
     ToolRun run = runTool({"host", "--device", "sim:" + kExamples + "/taps.json", "--speed", "0", "--set",
