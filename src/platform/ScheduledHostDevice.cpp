@@ -21,7 +21,6 @@ void ScheduledHostDevice::scheduleWithRunLoop(const std::shared_ptr<RunLoop>& ru
     if (!runLoop) return;
     detachSource(true);
     std::lock_guard<std::mutex> guard(_lock);
-    scheduleRequestedLocked();
     _runLoop = runLoop;
     _mode = mode;
     _source = attachSourceLocked();

@@ -38,9 +38,8 @@ protected:
     // With _lock held, after a registration and after scheduling (the
     // simulated device wakes its loop for reports that waited).
     virtual void deliveryMayStartLocked() {}
-    // With _lock held, when scheduling and unscheduling are asked for
-    // (whether or not they change anything): the simulated device counts them.
-    virtual void scheduleRequestedLocked() {}
+    // With _lock held, when unscheduling is asked for (whether or not it
+    // changes anything): the simulated device counts them.
     virtual void unscheduleRequestedLocked() {}
 
     // A source taken from the device, to be removed from its loop. Removal

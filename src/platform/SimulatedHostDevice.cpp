@@ -23,19 +23,16 @@ SimulatedHostDevice::~SimulatedHostDevice()
 bool SimulatedHostDevice::open(std::uint32_t options)
 {
     std::lock_guard<std::mutex> guard(_lock);
-    ++_counters.opens;
     _counters.lastOpenOptions = options;
-    if (_unplugged || _failOpen) return false;
+    if (_failOpen) return false;
     _open = true;
     if (deliverableLocked() && !_pending.empty()) signalLocked();
     return true;
 }
 
-void SimulatedHostDevice::close(std::uint32_t options)
+void SimulatedHostDevice::close(std::uint32_t)
 {
     std::lock_guard<std::mutex> guard(_lock);
-    ++_counters.closes;
-    _counters.lastCloseOptions = options;
     _open = false;
 }
 
@@ -43,8 +40,6 @@ std::int32_t SimulatedHostDevice::getReport(HidReportType type, std::uint32_t re
                                             std::size_t& length)
 {
     std::lock_guard<std::mutex> guard(_lock);
-    ++_counters.getReports;
-    if (_unplugged) return kHostDeviceNoDevice;
     if (!_open) return kHostDeviceNotOpen;
     if (buffer == nullptr || length == 0) return kHostDeviceBadArgument;
     if (_getReportFailure) return *_getReportFailure;
@@ -60,7 +55,6 @@ std::int32_t SimulatedHostDevice::getReport(HidReportType type, std::uint32_t re
 PropertyValue SimulatedHostDevice::getProperty(const std::string& key)
 {
     std::lock_guard<std::mutex> guard(_lock);
-    if (_unplugged) return {};
     auto it = _properties.find(key);
     return it == _properties.end() ? PropertyValue() : it->second;
 }
@@ -68,7 +62,7 @@ PropertyValue SimulatedHostDevice::getProperty(const std::string& key)
 bool SimulatedHostDevice::setProperty(const std::string& key, const PropertyValue& value)
 {
     std::lock_guard<std::mutex> guard(_lock);
-    if (_unplugged || _refusePropertyWrites) return false;
+    if (_refusePropertyWrites) return false;
     _properties[key] = value;
     return true;
 }
@@ -83,8 +77,6 @@ void SimulatedHostDevice::deliveryMayStartLocked()
     if (deliverableLocked() && !_pending.empty()) signalLocked();
 }
 
-void SimulatedHostDevice::scheduleRequestedLocked() { ++_counters.schedules; }
-
 void SimulatedHostDevice::unscheduleRequestedLocked() { ++_counters.unschedules; }
 
 void SimulatedHostDevice::pushInputReport(std::vector<std::uint8_t> report)
@@ -92,16 +84,9 @@ void SimulatedHostDevice::pushInputReport(std::vector<std::uint8_t> report)
     std::uint64_t timeStamp = MonotonicClock::now();
     {
         std::lock_guard<std::mutex> guard(_lock);
-        if (_unplugged) {
-            ++_counters.reportsDropped;
-        } else {
-            if (_pending.size() >= kMaxPendingReports) {
-                _pending.pop_front();
-                ++_counters.reportsDropped;
-            }
-            _pending.push_back({std::move(report), timeStamp});
-            if (deliverableLocked()) signalLocked();
-        }
+        if (_pending.size() >= kMaxPendingReports) _pending.pop_front();
+        _pending.push_back({std::move(report), timeStamp});
+        if (deliverableLocked()) signalLocked();
         _progress.notify_all();
     }
 }
@@ -132,18 +117,6 @@ void SimulatedHostDevice::refusePropertyWrites(bool refuse)
 {
     std::lock_guard<std::mutex> guard(_lock);
     _refusePropertyWrites = refuse;
-}
-
-void SimulatedHostDevice::unplug()
-{
-    {
-        std::lock_guard<std::mutex> guard(_lock);
-        _unplugged = true;
-        _open = false;
-        _counters.reportsDropped += _pending.size();
-        _pending.clear();
-        _progress.notify_all();
-    }
 }
 
 SimulatedHostDevice::Counters SimulatedHostDevice::counters() const
@@ -182,15 +155,9 @@ bool SimulatedHostDevice::waitUntilIdle(std::chrono::nanoseconds timeout)
     return _progress.wait_for(guard, timeout, [this] { return _pending.empty() && !_delivering; });
 }
 
-bool SimulatedHostDevice::waitForDelivered(std::uint64_t count, std::chrono::nanoseconds timeout)
-{
-    std::unique_lock<std::mutex> guard(_lock);
-    return _progress.wait_for(guard, timeout, [&] { return _counters.reportsDelivered >= count; });
-}
-
 bool SimulatedHostDevice::deliverableLocked() const
 {
-    return _open && !_unplugged && _source != 0 && _receiver.callback != nullptr;
+    return _open && _source != 0 && _receiver.callback != nullptr;
 }
 
 void SimulatedHostDevice::signalLocked()
@@ -225,7 +192,6 @@ void SimulatedHostDevice::deliverOne()
     {
         std::lock_guard<std::mutex> guard(_lock);
         _delivering = false;
-        ++_counters.reportsDelivered;
         if (deliverableLocked() && !_pending.empty()) signalLocked();
         _progress.notify_all();
     }

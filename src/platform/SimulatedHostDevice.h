@@ -25,8 +25,7 @@ namespace VeltoHost {
 // and delivered once all three hold: the host schedules the device from
 // another thread than the one pushing, and a test must not lose the reports
 // it pushed right after scheduling. Beyond the limit the oldest report is
-// dropped, as a device's own buffer would overflow. unplug() ends delivery
-// for good and drops what is pending.
+// dropped, as a device's own buffer would overflow.
 //
 // Feature reports and properties come from tables the test fills; failures
 // can be injected; counters tell the test what the plug-in did.
@@ -37,15 +36,8 @@ public:
     static constexpr std::size_t kMaxPendingReports = 4096;
 
     struct Counters {
-        std::uint64_t opens = 0;
-        std::uint64_t closes = 0;
-        std::uint64_t schedules = 0;
         std::uint64_t unschedules = 0;
-        std::uint64_t getReports = 0;
-        std::uint64_t reportsDelivered = 0;
-        std::uint64_t reportsDropped = 0;
         std::optional<std::uint32_t> lastOpenOptions;
-        std::optional<std::uint32_t> lastCloseOptions;
     };
 
     static Ref create() { return std::make_shared<SimulatedHostDevice>(); }
@@ -81,9 +73,6 @@ public:
     void failGetReport(std::int32_t status);
     void failOpen(bool fail);
     void refusePropertyWrites(bool refuse);
-    // The device goes away: delivery ends, pending reports are dropped and
-    // every later operation reports kHostDeviceNoDevice or fails.
-    void unplug();
 
     Counters counters() const;
     bool isOpen() const;
@@ -94,8 +83,6 @@ public:
     // Blocks until every report pushed so far was delivered or dropped;
     // false when `timeout` passed first (a test failure, not a timing).
     bool waitUntilIdle(std::chrono::nanoseconds timeout = std::chrono::seconds(10));
-    // Blocks until at least `count` reports were delivered in all.
-    bool waitForDelivered(std::uint64_t count, std::chrono::nanoseconds timeout = std::chrono::seconds(10));
 
 private:
     struct PendingReport {
@@ -109,7 +96,6 @@ private:
 
     RunLoop::SourceId attachSourceLocked() override;
     void deliveryMayStartLocked() override;
-    void scheduleRequestedLocked() override;
     void unscheduleRequestedLocked() override;
 
     const int _eventFd;
@@ -117,7 +103,6 @@ private:
     // Guarded by _lock.
     Counters _counters;
     bool _open = false;
-    bool _unplugged = false;
     bool _failOpen = false;
     bool _refusePropertyWrites = false;
     std::optional<std::int32_t> _getReportFailure;

@@ -98,42 +98,6 @@ TEST(SimulatedHostDeviceTest, DeliversPushedReportsInOrderOnTheLoopThread)
     EXPECT_EQ(device->pendingReportCount(), 1u);
 }
 
-TEST(SimulatedHostDeviceTest, UnplugEndsDeliveryAndEveryOperation)
-{
-    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
-    device->setFeatureReport(0x1F, {0x1F});
-    device->setProperty("VendorID", PropertyValue::uint32(0x1234));
-    Receiver receiver;
-    std::thread loop([&] {
-        ASSERT_TRUE(device->open(0));
-        device->registerInputReportWithTimeStampCallback(receiver.buffer.data(), receiver.buffer.size(),
-                                                         &Receiver::callback, &receiver);
-        device->scheduleWithRunLoop(RunLoop::current(), kMode);
-        device->pushInputReport({1});
-        ASSERT_EQ(RunLoop::run(kMode, std::nullopt, true), RunLoop::RunResult::HandledSource);
-
-        device->pushInputReport({2});
-        device->unplug();
-        device->pushInputReport({3});
-        // The source stays attached until unscheduled, but nothing arrives.
-        RunLoop::run(kMode, 0ns, false);
-        device->unscheduleFromRunLoop(RunLoop::current(), kMode);
-        EXPECT_EQ(RunLoop::run(kMode, std::nullopt, false), RunLoop::RunResult::Finished);
-    });
-    loop.join();
-
-    ASSERT_EQ(receiver.deliveries.size(), 1u);
-    EXPECT_EQ(receiver.deliveries[0].reportID, 1u);
-    EXPECT_EQ(device->counters().reportsDropped, 2u);
-
-    std::array<std::uint8_t, 8> buffer{};
-    std::size_t length = buffer.size();
-    EXPECT_EQ(device->getReport(HidReportType::Feature, 0x1F, buffer.data(), length), kHostDeviceNoDevice);
-    EXPECT_FALSE(device->open(0));
-    EXPECT_FALSE(device->getProperty("VendorID").hasValue());
-    EXPECT_FALSE(device->setProperty("VendorID", PropertyValue::uint32(1)));
-}
-
 TEST(HostDeviceRegistryTest, ServiceHandlesFindTheirDevices)
 {
     HostDeviceRegistry& registry = HostDeviceRegistry::shared();
