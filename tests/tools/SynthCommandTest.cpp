@@ -15,7 +15,7 @@ namespace {
 // terabytes of shadow memory up front.
 constexpr bool kAddressSpaceLimitsWork = !VELTO_SANITIZED;
 
-// Each line NAME: SCRIPT of the examples' list, as scripts/make-examples reads it.
+// Each line NAME: SCRIPT of the examples' list, as scripts/make-examples reads it, with its truth.
 TEST(SynthCommand, ExamplesRegenerateByteForByte)
 {
     TempDir dir;
@@ -26,9 +26,11 @@ TEST(SynthCommand, ExamplesRegenerateByteForByte)
         if (line.empty() || line[0] == '#' || colon == std::string::npos) continue;
         const std::string name = line.substr(0, colon);
         const fs::path output = dir.file(name + ".json");
-        const ToolRun run = runTool({"synth", line.substr(line.find_first_not_of(' ', colon + 1)), "-o", output.string()});
+        const ToolRun run = runTool(
+            {"synth", line.substr(line.find_first_not_of(' ', colon + 1)), "-o", output.string(), "--truth", "auto"});
         ASSERT_EQ(run.status, 0) << name << ": " << run.err;
         EXPECT_TRUE(readFile(output) == readFile(kExamples + "/" + name + ".json")) << name;
+        EXPECT_EQ(readFile(dir.file(name + ".truth.jsonl")), readFile(kExamples + "/" + name + ".truth.jsonl")) << name;
         ++examples;
     }
     EXPECT_GE(examples, 5);
