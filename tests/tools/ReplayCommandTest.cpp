@@ -161,16 +161,7 @@ TEST(ReplayCommand, JsonLinesWithDumpsGiveOneRecordPerFrameThatAgreesWithEventsA
     EXPECT_GT(records, 500);
     ASSERT_FALSE(eventLines.empty());
     EXPECT_EQ(recordEvents, eventLines);
-
-    // Readable output keeps the dumps as text blocks: each frame's counters, pads and groups, in that order.
-    const ToolRun text = runTool({"replay", file, "--dump"});
-    std::size_t at = 0;
-    for (const std::string part : {"Event Stats", "Touch State Description", "Virtual State Description"}) {
-        at = text.out.find("Frame 1 @1000ms, *** " + part + " ***\n", at);
-        ASSERT_NE(at, std::string::npos) << part;
-    }
-    EXPECT_LT(at, text.out.find("Frame 2 @1010ms, *** Event Stats ***\n"));
-    EXPECT_EQ(text.out.find("{\"frame\""), std::string::npos);
+    // The readable dump is pinned, frame by frame, by the examples' digests.
 }
 
 TEST(ReplayCommand, PacedPlaybackShortensClockJumpsAndSaysSoOnce)
