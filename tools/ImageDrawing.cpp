@@ -34,7 +34,7 @@ constexpr std::array<std::string_view, 13> kSensorLayoutRows = {
 // characters and longer numbers push the rest of the row right.
 void appendPadNumber(std::string& drawing, const InputReport::Image& image, bool useLevels, char c, int runLength)
 {
-    assert(c>='A' && c<='O');
+    assert(c >= 'A' && c <= 'O');
     const auto pad = static_cast<std::size_t>(c - 'A');
     const std::intmax_t number = useLevels ? std::intmax_t{image.levels[pad]} : std::intmax_t{image.readings[pad]};
     const std::string text = VeltoHost::formatLog("%*jd", runLength / 2, number);

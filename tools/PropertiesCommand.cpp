@@ -41,20 +41,22 @@ std::vector<PropertiesCommand::Property> PropertiesCommand::properties()
                     jsonOf(fresh.getState(Pipeline::kDebugInfoKey)),
                     "the pipeline's counts of device resets and of gaps in the image frame numbers"});
 
-    const std::string algs = pipeline + Pipeline::kAlgsDomain + ".";
+    // Keys as the pipeline takes them, and as the plug-in's host names them.
+    const std::string algsInPipeline = std::string(Pipeline::kAlgsDomain) + ".";
+    const std::string algs = pipeline + algsInPipeline;
     for (const Algs::StateKey& key : Algs::stateKeys()) {
         std::string defaultValue;
         if (key.indexed) {
             // The family's defaults, in index order, up to the first null.
             const std::string stem = std::string(key.name).substr(0, std::string(key.name).rfind('.') + 1);
             for (std::size_t index = 0;; ++index) {
-                const auto value = fresh.getState(std::string(Pipeline::kAlgsDomain) + "." + stem + std::to_string(index));
+                const auto value = fresh.getState(algsInPipeline + stem + std::to_string(index));
                 if (value.isNull()) break;
                 defaultValue += (index ? ", " : "") + jsonOf(value);
             }
             defaultValue = "[" + defaultValue + "]";
         } else if (key.get) {
-            defaultValue = shortDefault(jsonOf(fresh.getState(std::string(Pipeline::kAlgsDomain) + "." + key.name)));
+            defaultValue = shortDefault(jsonOf(fresh.getState(algsInPipeline + key.name)));
         }
         list.push_back({algs + key.name, key.type, accessOf(key.get != nullptr, key.set != nullptr), defaultValue,
                         key.meaning});

@@ -59,7 +59,7 @@ HidrawHostDevice::HidrawHostDevice(int fd, bool numberedReports) : _log("HostDev
     _numberedReports = numberedReports;
 }
 
-HidrawHostDevice::~HidrawHostDevice() { detachSource(true); }
+HidrawHostDevice::~HidrawHostDevice() { detachSource(); }
 
 bool HidrawHostDevice::open(std::uint32_t options)
 {

@@ -19,7 +19,7 @@ void ScheduledHostDevice::registerInputReportWithTimeStampCallback(std::uint8_t*
 void ScheduledHostDevice::scheduleWithRunLoop(const std::shared_ptr<RunLoop>& runLoop, const std::string& mode)
 {
     if (!runLoop) return;
-    detachSource(true);
+    detachSource();
     std::lock_guard<std::mutex> guard(_lock);
     _runLoop = runLoop;
     _mode = mode;
@@ -51,12 +51,12 @@ void ScheduledHostDevice::TakenSource::remove() const
     if (runLoop && source != 0) runLoop->removeSource(source);
 }
 
-void ScheduledHostDevice::detachSource(bool forgetLoop)
+void ScheduledHostDevice::detachSource()
 {
     TakenSource taken;
     {
         std::lock_guard<std::mutex> guard(_lock);
-        taken = takeSourceLocked(forgetLoop);
+        taken = takeSourceLocked(true);
     }
     taken.remove();
 }

@@ -52,9 +52,9 @@ protected:
     };
     // With _lock held: takes the source; `forgetLoop` also ends the scheduling.
     TakenSource takeSourceLocked(bool forgetLoop);
-    // Both steps. A backend's destructor calls it first: the source's
+    // Both steps, ending the scheduling. A backend's destructor calls it first: the source's
     // callback reaches the backend.
-    void detachSource(bool forgetLoop);
+    void detachSource();
     // Copies the report into the registered buffer (truncated to its size)
     // and calls the callback. Call with _deliveryLock held, not _lock.
     void deliver(const Receiver& receiver, const std::uint8_t* report, std::size_t length, std::uint32_t reportID,

@@ -16,7 +16,7 @@ SimulatedHostDevice::SimulatedHostDevice() : _eventFd(eventfd(0, EFD_NONBLOCK | 
 
 SimulatedHostDevice::~SimulatedHostDevice()
 {
-    detachSource(true);
+    detachSource();
     if (_eventFd >= 0) ::close(_eventFd);
 }
 

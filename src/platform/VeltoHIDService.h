@@ -34,7 +34,7 @@ public:
     std::uint32_t release() noexcept;
 
     virtual VeltoStatus probeWithService(std::uint32_t service, const PropertyValue& properties,
-                                                    std::int32_t* outScore);
+                                         std::int32_t* outScore);
     virtual VeltoStatus startWithService(std::uint32_t service, const PropertyValue& properties);
     virtual VeltoStatus stop();
     virtual bool openWithOptions(std::uint32_t options);
@@ -45,8 +45,7 @@ public:
     virtual void setEventCallback(VeltoEventCallback callback, void* target, void* refcon);
     virtual void scheduleWithDispatchQueue(const SerialQueue::Ref& queue);
     virtual void unscheduleWithDispatchQueue(const SerialQueue::Ref& queue);
-    virtual HidEventRef copyEventWithType(std::uint32_t type, HidEvent* matching,
-                                                     std::uint32_t options);
+    virtual HidEventRef copyEventWithType(std::uint32_t type, HidEvent* matching, std::uint32_t options);
     virtual VeltoStatus setOutputEvent(HidEvent* event);
 
 private:

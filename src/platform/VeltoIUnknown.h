@@ -15,27 +15,24 @@ class VeltoIUnknown {
 public:
     VeltoIUnknown() = delete;
 
-    static VeltoStatus QueryInterface(VeltoInterfaceRef self, VeltoUUID iid,
-                                                 VeltoInterfaceRef* out);
+    static VeltoStatus QueryInterface(VeltoInterfaceRef self, VeltoUUID iid, VeltoInterfaceRef* out);
     static std::uint32_t AddRef(VeltoInterfaceRef self);
     static std::uint32_t Release(VeltoInterfaceRef self);
 
-    static VeltoStatus Probe(VeltoInterfaceRef self, const PropertyValue& properties,
-                                        std::uint32_t service, std::int32_t* outScore);
-    static VeltoStatus Start(VeltoInterfaceRef self, const PropertyValue& properties,
-                                        std::uint32_t service);
+    static VeltoStatus Probe(VeltoInterfaceRef self, const PropertyValue& properties, std::uint32_t service,
+                             std::int32_t* outScore);
+    static VeltoStatus Start(VeltoInterfaceRef self, const PropertyValue& properties, std::uint32_t service);
     static VeltoStatus Stop(VeltoInterfaceRef self);
 
     static bool open(VeltoInterfaceRef self, std::uint32_t options);
     static void close(VeltoInterfaceRef self, std::uint32_t options);
     static PropertyValue copyProperty(VeltoInterfaceRef self, const char* key);
     static bool setProperty(VeltoInterfaceRef self, const char* key, const PropertyValue& value);
-    static void setEventCallback(VeltoInterfaceRef self, VeltoEventCallback callback,
-                                 void* target, void* refcon);
+    static void setEventCallback(VeltoInterfaceRef self, VeltoEventCallback callback, void* target, void* refcon);
     static void scheduleWithDispatchQueue(VeltoInterfaceRef self, SerialQueue* queue);
     static void unscheduleFromDispatchQueue(VeltoInterfaceRef self, SerialQueue* queue);
-    static HidEventRef copyEvent(VeltoInterfaceRef self, std::uint32_t type,
-                                            HidEvent* matching, std::uint32_t options);
+    static HidEventRef copyEvent(VeltoInterfaceRef self, std::uint32_t type, HidEvent* matching,
+                                 std::uint32_t options);
     static VeltoStatus setOutputEvent(VeltoInterfaceRef self, HidEvent* event);
 };
 

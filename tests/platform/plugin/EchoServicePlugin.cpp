@@ -107,8 +107,8 @@ public:
         _dispatch.queue = queue;
         _dispatch.sender = getServiceInterface();
         // Moved in: the queue reference is gone before the exit signal.
-        _thread.start("echo.reports", {nullptr, [this, info = _dispatch]() mutable { handleInputReports(std::move(info)); },
-                                       nullptr});
+        _thread.start("echo.reports",
+                      {nullptr, [this, info = _dispatch]() mutable { handleInputReports(std::move(info)); }, nullptr});
     }
     void unscheduleWithDispatchQueue(const SerialQueue::Ref&) override
     {
@@ -154,7 +154,10 @@ public:
     VeltoInterfaceRef pluginInterface() { return &_interface; }
 
 private:
-    static PluginOnly& from(VeltoInterfaceRef self) { return *static_cast<PluginOnly*>((*static_cast<PluginInterfaceTable**>(self))->reserved); }
+    static PluginOnly& from(VeltoInterfaceRef self)
+    {
+        return *static_cast<PluginOnly*>((*static_cast<PluginInterfaceTable**>(self))->reserved);
+    }
     static VeltoStatus query(VeltoInterfaceRef self, VeltoUUID iid, VeltoInterfaceRef* out)
     {
         if (iid != kVeltoPluginInterfaceID) return kVeltoNoInterface;
