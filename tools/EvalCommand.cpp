@@ -256,7 +256,10 @@ int EvalCommand::run(const Options& options, std::ostream& out, std::ostream& er
     try {
         grid = VeltoTouch::SweepGrid::combinations(axes);
     } catch (const std::invalid_argument& error) {
-        throw ToolError(error.what());
+        // Each axis was checked with the command line; only their product is
+        // left, and it is as much a usage error as one axis too long.
+        err << "veltotouch: " << error.what() << '\n';
+        return kUsageError;
     }
 
     const VeltoTouch::CorpusShard shard =

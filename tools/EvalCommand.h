@@ -31,8 +31,9 @@ public:
         bool json = false;
     };
 
-    // Returns the exit status: 2 for options that do not go together, 0
-    // otherwise; throws ToolError (or the recording's error) on failure.
+    // Returns the exit status: 2 for options that do not go together or a
+    // sweep grid beyond its limit, 0 otherwise; throws ToolError (or the
+    // recording's error) on failure.
     static int run(const Options& options, std::ostream& out, std::ostream& err);
 };
 

@@ -1,6 +1,7 @@
 #include "HostCommand.h"
 
 #include "EventFormatter.h"
+#include "OutputFile.h"
 #include "StateArguments.h"
 #include "ToolError.h"
 #include "ToolFiles.h"
@@ -18,7 +19,6 @@
 #include <cerrno>
 #include <chrono>
 #include <cstring>
-#include <fstream>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -103,14 +103,18 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
     StopSignals signals;
 
     const std::string plugin = VeltoHost::PluginLocator::chosenOrFound(options.plugin);
-    // Opened before the first report: a session is never played only to find
-    // at the end that its recording cannot be saved.
-    std::ofstream savedRecording;
-    if (!options.saveRecording.empty()) savedRecording = ToolFiles::create(options.saveRecording);
     std::vector<std::pair<std::string, PropertyValue>> settings;
     for (const auto& [key, text] : options.settings) settings.emplace_back(key, StateArguments::parseValue(key, text));
 
     Device device = openDevice(options.device);
+    // Opened before the first report: a session is never played only to find
+    // at the end that its recording cannot be saved, or that saving it would
+    // overwrite the recording played or the plug-in.
+    std::optional<OutputFile> savedRecording;
+    if (!options.saveRecording.empty()) {
+        const std::string played = device.simulated ? device.recordingPath : options.device;
+        savedRecording.emplace(options.saveRecording, std::vector<std::string>{played, plugin});
+    }
 
     HostEventSystem host;
     EventFormatter formatter(options.jsonLines, MonotonicClock::now());
@@ -182,9 +186,9 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
         }
         out.flush();
     }
-    if (!options.saveRecording.empty()) {
-        savedRecording << host.copyProperty("Recording").asString();
-        ToolFiles::close(savedRecording, options.saveRecording);
+    if (savedRecording) {
+        savedRecording->stream() << host.copyProperty("Recording").asString();
+        savedRecording->commit();
     }
     host.stop();
     if (!fault.empty()) {

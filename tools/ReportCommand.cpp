@@ -1,12 +1,12 @@
 #include "ReportCommand.h"
 
 #include "DumpCommand.h"
+#include "OutputFile.h"
 #include "StateArguments.h"
 #include "ToolFiles.h"
 #include "report/RecordingReport.h"
 
 #include <filesystem>
-#include <fstream>
 #include <functional>
 #include <memory>
 #include <string>
@@ -25,29 +25,21 @@ void ReportCommand::run(const Options& options, std::ostream& err)
     }
     // The recording is read as it plays, so that its length does not matter.
     // A bad output path fails before the replay; a recording that turns out
-    // bad leaves no page behind.
+    // bad leaves an existing page as it was.
     const ToolFiles::File recording = ToolFiles::openRecording(options.file);
-    std::ofstream out = ToolFiles::create(options.output);
+    OutputFile out(options.output, {options.file});
     report.source = std::filesystem::path(options.file).filename().string();
     report.title = options.title.empty() ? report.source : options.title;
     report.settings = options.settings;
 
     auto pipeline = std::make_shared<VeltoTouch::Pipeline>();
     StateArguments::apply(*pipeline, options.settings, err);
-    std::string page;
-    try {
-        page = RecordingReport::html(
-            [&](const std::function<void(VeltoTouch::PipelineRecording::Frame&&)>& play) {
-                return *ToolFiles::streamRecording(recording.get(), options.file, play);
-            },
-            pipeline, report);
-    } catch (...) {
-        out.close();
-        std::filesystem::remove(options.output);
-        throw;
-    }
-    out << page;
-    ToolFiles::close(out, options.output);
+    out.stream() << RecordingReport::html(
+        [&](const std::function<void(VeltoTouch::PipelineRecording::Frame&&)>& play) {
+            return *ToolFiles::streamRecording(recording.get(), options.file, play);
+        },
+        pipeline, report);
+    out.commit();
 }
 
 }  // namespace VeltoTool

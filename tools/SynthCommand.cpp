@@ -1,13 +1,15 @@
 #include "SynthCommand.h"
 
 #include "GestureScript.h"
+#include "OutputFile.h"
 #include "RandomScript.h"
 #include "Synthesizer.h"
 #include "ToolError.h"
 #include "ToolFiles.h"
 #include "recording/ContainerWriter.h"
 
-#include <filesystem>
+#include <functional>
+#include <optional>
 #include <sstream>
 
 namespace VeltoTool {
@@ -25,35 +27,37 @@ void checkFramePeriod(std::uint32_t framePeriodMs)
 // Frames go to the writer as they are made: an hour of 1 ms frames is
 // millions of them, and neither they nor their JSON may pile up in memory.
 // A write that fails (a full disk) ends the synthesis at once instead of
-// after the rest of the script.
-void synthesizeInto(std::ostream& out, const std::string& name, const std::vector<GestureScript::Step>& steps,
-                    std::uint32_t framePeriodMs, std::uint32_t seed, std::ostream* truth = nullptr,
-                    const std::string& truthName = {})
+// after the rest of the script: `checkWritten` throws once one has.
+void synthesizeInto(std::ostream& out, const std::function<void()>& checkWritten,
+                    const std::vector<GestureScript::Step>& steps, std::uint32_t framePeriodMs, std::uint32_t seed,
+                    OutputFile* truth = nullptr)
 {
     Synthesizer synthesizer(framePeriodMs, seed);
     ContainerWriter writer(out);
     Synthesizer::TruthSink truthSink;
     if (truth) {
         truthSink = [&](const VeltoTouch::TruthRecord& record) {
-            *truth << record.jsonLine() << '\n';
-            ToolFiles::checkWritten(*truth, truthName);
+            truth->stream() << record.jsonLine() << '\n';
+            truth->checkWritten();
         };
     }
     synthesizer.synthesize(
         steps,
         [&](const PipelineRecording::Frame& frame) {
             writer.write(frame);
-            ToolFiles::checkWritten(out, name);
+            checkWritten();
         },
         truthSink);
     writer.finish();
 }
 
-void removeRegularFile(const std::string& path)
+// The truth written over its own recording would leave neither; the check
+// goes by path too, as neither may exist yet.
+void refuseTruthOverRecording(const SynthCommand::Options& options, const std::string& truthPath)
 {
-    // Only a regular file is removed: the output may be a device (/dev/null).
-    std::error_code ignored;
-    if (std::filesystem::is_regular_file(path, ignored)) std::filesystem::remove(path, ignored);
+    if (truthPath.empty() || !OutputFile::sameFile(truthPath, options.output)) return;
+    throw ToolError(truthPath + ": is the same file as the recording " + options.output +
+                    "; write the truth elsewhere");
 }
 
 }  // namespace
@@ -62,7 +66,7 @@ std::string SynthCommand::containerFor(const std::string& script, std::uint32_t 
 {
     checkFramePeriod(framePeriodMs);
     std::ostringstream text;
-    synthesizeInto(text, "container", GestureScript::parse(script), framePeriodMs, seed);
+    synthesizeInto(text, [] {}, GestureScript::parse(script), framePeriodMs, seed);
     return std::move(text).str();
 }
 
@@ -72,40 +76,30 @@ void SynthCommand::run(const Options& options)
     if (options.script.empty() == (options.randomTouches == 0)) {
         throw ToolError("synth needs either a SCRIPT or --random N with N at least 1");
     }
+    const std::string truthPath =
+        options.truth == "auto" ? VeltoTouch::TruthRecord::pathBeside(options.output) : options.truth;
+    const bool scriptFile = options.randomTouches == 0 && options.script[0] == '@';
+    std::vector<std::string> inputs;
+    if (scriptFile) inputs.push_back(options.script.substr(1));
+    refuseTruthOverRecording(options, truthPath);
+
     std::vector<GestureScript::Step> steps;
     if (options.randomTouches > 0) {
         steps = RandomScript::generate(options.randomTouches, options.seed);
     } else {
         // A faulty script leaves an existing output alone.
-        const std::string script = options.script[0] == '@' ? ToolFiles::read(options.script.substr(1)) : options.script;
-        steps = GestureScript::parse(script);
+        steps = GestureScript::parse(scriptFile ? ToolFiles::read(inputs.front()) : options.script);
     }
-    const std::string truthPath =
-        options.truth == "auto" ? VeltoTouch::TruthRecord::pathBeside(options.output) : options.truth;
-    // A bad output path fails before anything is generated.
-    std::ofstream out = ToolFiles::create(options.output);
-    std::ofstream truth;
-    bool truthCreated = false;
-    try {
-        if (!truthPath.empty()) {
-            truth = ToolFiles::create(truthPath);
-            truthCreated = true;
-        }
-        synthesizeInto(out, options.output, steps, options.framePeriodMs, options.seed,
-                       truthPath.empty() ? nullptr : &truth, truthPath);
-        ToolFiles::close(out, options.output);
-        if (!truthPath.empty()) ToolFiles::close(truth, truthPath);
-    } catch (...) {
-        // Half a container is no recording, and a truth without its
-        // recording is none; leave neither behind.
-        out.close();
-        removeRegularFile(options.output);
-        if (truthCreated) {
-            truth.close();
-            removeRegularFile(truthPath);
-        }
-        throw;
-    }
+    // A bad output path fails before anything is generated. Half a container
+    // is no recording, and a truth without its recording is none: both are
+    // committed only once both are complete.
+    OutputFile out(options.output, inputs);
+    std::optional<OutputFile> truth;
+    if (!truthPath.empty()) truth.emplace(truthPath, inputs);
+    synthesizeInto(out.stream(), [&] { out.checkWritten(); }, steps, options.framePeriodMs, options.seed,
+                   truth ? &*truth : nullptr);
+    out.commit();
+    if (truth) truth->commit();
 }
 
 }  // namespace VeltoTool

@@ -64,29 +64,6 @@ std::string ToolFiles::read(const std::string& path)
     return readText(path);
 }
 
-std::ofstream ToolFiles::create(const std::string& path)
-{
-    if (isDirectory(path)) throw ToolError(path + ": is a directory");
-    errno = 0;
-    std::ofstream out(path, std::ios::binary | std::ios::trunc);
-    if (!out) failWithErrno(path, "cannot create");
-    return out;
-}
-
-void ToolFiles::checkWritten(const std::ostream& out, const std::string& path)
-{
-    // errno still holds the failed write's reason (a full disk, say).
-    if (!out) failWithErrno(path, "write failed");
-}
-
-void ToolFiles::close(std::ofstream& out, const std::string& path)
-{
-    checkWritten(out, path);
-    errno = 0;
-    out.close();
-    if (!out) failWithErrno(path, "write failed");
-}
-
 VeltoTouch::PipelineRecording ToolFiles::readRecording(const std::string& path)
 {
     if (isDirectory(path)) throw ToolError(path + ": is a directory, " + std::string(kExpectedRecording));

@@ -5,7 +5,6 @@
 
 #include <cstdint>
 #include <cstdio>
-#include <fstream>
 #include <memory>
 #include <functional>
 #include <optional>
@@ -14,19 +13,12 @@
 namespace VeltoTool {
 
 // File access for the tool's commands, with errors (ToolError) that name the
-// file and say what was wrong with it in words a user can act on.
+// file and say what was wrong with it in words a user can act on. Outputs are
+// written through OutputFile.
 class ToolFiles {
 public:
     // The whole file; a directory is refused rather than read as empty text.
     static std::string read(const std::string& path);
-
-    // Opens `path` for writing, emptying it, so that a bad output path fails
-    // before any work is done.
-    static std::ofstream create(const std::string& path);
-    // Throws, naming the file, once a write to `out` has failed.
-    static void checkWritten(const std::ostream& out, const std::string& path);
-    // Closes a file made by create(); throws when any write to it failed.
-    static void close(std::ofstream& out, const std::string& path);
 
     // A recording read from a container file. Every failure is one line that
     // starts with the path: a directory, an empty file and text that is not

@@ -1,0 +1,265 @@
+#include "OutputFile.h"
+#include "SynthCommand.h"
+#include "ToolError.h"
+#include "ToolProcessSupport.h"
+#include "ToolTestSupport.h"
+
+#include <gtest/gtest.h>
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <csignal>
+#include <functional>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
+
+using namespace VeltoTool;
+using namespace VeltoTool::Testing;
+
+namespace {
+
+// Every name under the directory: a temporary file left behind shows here.
+std::set<std::string> namesIn(const fs::path& dir)
+{
+    std::set<std::string> names;
+    for (const auto& entry : fs::recursive_directory_iterator(dir)) {
+        names.insert(entry.path().lexically_relative(dir).string());
+    }
+    return names;
+}
+
+mode_t modeOf(const fs::path& path)
+{
+    struct stat status {};
+    ::stat(path.c_str(), &status);
+    return status.st_mode & 07777;
+}
+
+class Umask {
+public:
+    explicit Umask(mode_t mask) : _previous(::umask(mask)) {}
+    ~Umask() { ::umask(_previous); }
+
+private:
+    mode_t _previous;
+};
+
+using Arguments = std::function<std::vector<std::string>(const std::string& input, const std::string& output)>;
+
+// Each command's output named as its input: by the same path, through a
+// symbolic link and as a second hard link.
+TEST(OutputFile, AnOutputThatIsAnInputIsRefusedAndTheInputKept)
+{
+    const std::string taps = readFile(kExamples + "/taps.json");
+    struct Case {
+        const char* name;
+        std::string input;
+        Arguments arguments;
+        // What the refusal calls the input and the output.
+        const char* inputIs;
+        const char* outputIs;
+    };
+    const Case cases[] = {
+        {"report", taps, [](auto in, auto out) { return std::vector<std::string>{"report", in, "-o", out}; }, "input",
+         "output"},
+        {"host", taps,
+         [](auto in, auto out) {
+             return std::vector<std::string>{"host", "--device", "sim:" + in, "--speed", "0", "--save-recording", out};
+         },
+         "input", "output"},
+        {"synth script", "tap top",
+         [](auto in, auto out) { return std::vector<std::string>{"synth", "@" + in, "-o", out}; }, "input", "output"},
+        {"synth truth", taps,
+         [](auto in, auto out) { return std::vector<std::string>{"synth", "tap top", "-o", in, "--truth", out}; },
+         "recording", "truth"},
+    };
+    const std::function<fs::path(const fs::path&)> aliases[] = {
+        [](const fs::path& input) { return input; },
+        [](const fs::path& input) {
+            fs::create_symlink(input.filename(), input.parent_path() / "symlink");
+            return input.parent_path() / "symlink";
+        },
+        [](const fs::path& input) {
+            fs::create_hard_link(input, input.parent_path() / "hardlink");
+            return input.parent_path() / "hardlink";
+        },
+    };
+    for (const Case& c : cases) {
+        for (const auto& aliasOf : aliases) {
+            TempDir dir;
+            const fs::path input = dir.file("input", c.input);
+            const std::string output = aliasOf(input).string();
+            SCOPED_TRACE(std::string(c.name) + " -> " + output);
+            const std::set<std::string> names = namesIn(dir.path());
+            const ToolRun run = runTool(c.arguments(input.string(), output));
+            EXPECT_EQ(run.status, 1);
+            EXPECT_EQ(run.err, "veltotouch: " + output + ": is the same file as the " + c.inputIs + " " +
+                                   input.string() + "; write the " + c.outputIs + " elsewhere\n");
+            EXPECT_EQ(run.out, "");
+            EXPECT_TRUE(readFile(input) == c.input);
+            EXPECT_EQ(namesIn(dir.path()), names);
+        }
+    }
+}
+
+// Run as processes: a write past a file-size limit fails (File too large)
+// where an in-process run would fail nothing.
+TEST(OutputFile, AFailureLeavesThePreviousOutputAndNoTemporaryFile)
+{
+    TempDir dir;
+    std::string faultyText = readFile(kExamples + "/taps.json");
+    faultyText.resize(faultyText.rfind(']'));
+    faultyText += R"(, {"Type": "Gesture", "Timestamp": 1}]})";
+    const std::string faulty = dir.file("faulty.json", faultyText).string();
+    const std::string output = dir.file("output", "previous output\n").string();
+    struct Case {
+        std::vector<std::string> arguments;
+        ProcessSetup setup;
+        std::string error;
+    };
+    const Case cases[] = {
+        {{"report", faulty, "-o", output}, {}, faulty + ": invalid frame type"},
+        {{"synth", "hold top 60s", "-o", output}, ProcessSetup::fileSize(64u << 10), output + ": File too large"},
+        {{"host", "--device", "sim:" + kExamples + "/demo.json", "--speed", "0", "--save-recording", output},
+         ProcessSetup::fileSize(64u << 10), output + ": File too large"},
+    };
+    const std::set<std::string> names = namesIn(dir.path());
+    for (const Case& c : cases) {
+        ToolProcess tool(c.arguments, c.setup);
+        ASSERT_TRUE(tool.started());
+        const ToolProcess::Result result = tool.finish(ToolProcess::Seconds(120));
+        EXPECT_EQ(result.status, 1) << c.arguments[0];
+        EXPECT_EQ(result.err, "veltotouch: " + c.error + "\n");
+        EXPECT_EQ(readFile(output), "previous output\n") << c.arguments[0];
+        EXPECT_EQ(namesIn(dir.path()), names) << c.arguments[0];
+    }
+}
+
+// A long synthesis is stopped as soon as its temporary file is there.
+TEST(OutputFile, ASignalThatEndsTheToolLeavesThePreviousOutputAndNoTemporaryFile)
+{
+    TempDir dir;
+    const std::string output = dir.file("output", "previous output\n").string();
+    const std::set<std::string> names = namesIn(dir.path());
+    for (const int signal : {SIGINT, SIGTERM}) {
+        ToolProcess tool({"synth", "hold top 3600s", "--frame-period", "1", "-o", output});
+        ASSERT_TRUE(tool.started());
+        const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(60);
+        while (namesIn(dir.path()) == names && std::chrono::steady_clock::now() < deadline) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        }
+        ASSERT_NE(namesIn(dir.path()), names) << "no temporary file appeared";
+        tool.signal(signal);
+        const ToolProcess::Result result = tool.finish(ToolProcess::Seconds(60));
+        EXPECT_EQ(result.signal, signal) << result.err;
+        EXPECT_EQ(readFile(output), "previous output\n");
+        EXPECT_EQ(namesIn(dir.path()), names);
+    }
+}
+
+// A link stays a link and its target is replaced; an existing file keeps its
+// mode, a new one gets 0666 less the umask.
+TEST(OutputFile, AnOutputThroughALinkReplacesItsTargetWithTheModeItShouldHave)
+{
+    const Umask umask(027);
+    const std::string recording = SynthCommand::containerFor("tap top", 10, 1);
+    struct Case {
+        const char* output;
+        const char* linkTo;  // nullptr: no link
+        bool targetExists;
+        mode_t mode;
+    };
+    const Case cases[] = {
+        {"new.json", nullptr, false, 0640},
+        {"old.json", nullptr, true, 0604},
+        {"link.json", "old.json", true, 0604},
+        {"link.json", "sub/old.json", true, 0604},
+        {"dangling.json", "new.json", false, 0640},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.output);
+        TempDir dir;
+        const fs::path output = dir.path() / c.output;
+        const fs::path target = c.linkTo ? dir.path() / c.linkTo : output;
+        fs::create_directories(target.parent_path());
+        if (c.targetExists) {
+            dir.file(target.lexically_relative(dir.path()).string(), "previous output\n");
+            fs::permissions(target, fs::perms(0604));
+        }
+        if (c.linkTo) fs::create_symlink(c.linkTo, output);
+        std::set<std::string> names = namesIn(dir.path());
+        const ToolRun run = runTool({"synth", "tap top", "-o", output.string()});
+        ASSERT_EQ(run.status, 0) << run.err;
+        EXPECT_EQ(fs::is_symlink(output), c.linkTo != nullptr);
+        EXPECT_TRUE(readFile(target) == recording);
+        EXPECT_EQ(modeOf(target), c.mode);
+        names.insert(target.lexically_relative(dir.path()).string());
+        EXPECT_EQ(namesIn(dir.path()), names);
+    }
+}
+
+// The descriptor is how a daemon writes the file; commit() puts it in place.
+TEST(OutputFile, WhatTheDescriptorWritesIsInPlaceOnlyAfterCommit)
+{
+    for (const bool commit : {false, true}) {
+        TempDir dir;
+        const fs::path path = dir.file("recording.json", "previous output\n");
+        {
+            OutputFile out(path.string());
+            ASSERT_EQ(::write(out.descriptor(), "written", 7), 7);
+            EXPECT_EQ(readFile(path), "previous output\n");
+            if (commit) out.commit();
+        }
+        EXPECT_EQ(readFile(path), commit ? "written" : "previous output\n");
+        EXPECT_EQ(namesIn(dir.path()), std::set<std::string>{"recording.json"});
+    }
+}
+
+// There is nothing to replace in a pipe or a device: it is written to.
+TEST(OutputFile, AnOutputThatIsNoRegularFileIsWrittenDirectly)
+{
+    TempDir dir;
+    const fs::path fifo = dir.path() / "fifo";
+    ASSERT_EQ(::mkfifo(fifo.c_str(), 0600), 0);
+    const int reader = ::open(fifo.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+    ASSERT_GE(reader, 0);
+    {
+        OutputFile out(fifo.string());
+        out.stream() << "through the pipe";
+        out.commit();
+    }
+    char text[64] = {};
+    EXPECT_EQ(::read(reader, text, sizeof text), 16);
+    EXPECT_STREQ(text, "through the pipe");
+    ::close(reader);
+    EXPECT_TRUE(fs::is_fifo(fifo));
+    EXPECT_EQ(namesIn(dir.path()), std::set<std::string>{"fifo"});
+}
+
+TEST(OutputFile, OutputsThatCannotBeMadeAreRefusedNamingTheFile)
+{
+    TempDir dir;
+    const std::string file = dir.file("file", "text").string();
+    const std::string directory = dir.path().string();
+    const std::pair<std::string, std::string> cases[] = {
+        {directory, directory + ": is a directory"},
+        {directory + "/missing/out.json", directory + "/missing/out.json: No such file or directory"},
+        {file + "/out.json", file + "/out.json: cannot create a file in " + file + ": Not a directory"},
+    };
+    for (const auto& [path, message] : cases) {
+        try {
+            OutputFile out(path);
+            ADD_FAILURE() << path << " was taken";
+        } catch (const ToolError& error) {
+            EXPECT_EQ(error.what(), message);
+        }
+    }
+    EXPECT_EQ(namesIn(dir.path()), std::set<std::string>{"file"});
+}
+
+}  // namespace
