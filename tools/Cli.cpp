@@ -15,6 +15,7 @@
 #include "ToolVersion.h"
 #include "evaluation/CorpusShard.h"
 #include "evaluation/SweepGrid.h"
+#include "host/BusConnection.h"
 
 #include <CLI/CLI.hpp>
 
@@ -47,6 +48,18 @@ CLI::Validator argumentCheck(const std::string& description, Parse parse)
             return {};
         },
         description);
+}
+
+const CLI::Validator& busCheck()
+{
+    static const CLI::Validator check = argumentCheck("BUS", [](const std::string& text) {
+        try {
+            VeltoHost::BusConnection::Address::parse(text);
+        } catch (const std::invalid_argument& error) {
+            throw ToolError(error.what());
+        }
+    });
+    return check;
 }
 
 const CLI::Validator& settingCheck()
@@ -215,7 +228,9 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     auto* daemonCommand = app.add_subcommand("daemon", "Serve touch devices on D-Bus and turn their gestures into keys");
     daemonCommand->add_option("--config", daemon.config, "TOML settings: devices to take, key map, log level")
         ->check(CLI::ExistingFile);
-    daemonCommand->add_option("--bus", daemon.bus, "system, session or a D-Bus address")->capture_default_str();
+    daemonCommand->add_option("--bus", daemon.bus, "system, session or a D-Bus address")
+        ->capture_default_str()
+        ->check(busCheck());
     daemonCommand->add_option("--device", daemon.devices, "sim:FILE (a recording played, then left attached) or /dev/hidrawN")
         ->check(deviceCheck());
     daemonCommand->add_option("--speed", daemon.speed, "Simulated devices: play S times faster than recorded (0: at once)")
@@ -233,7 +248,9 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
 
     CtlCommand::Options ctl;
     auto* ctlCommand = app.add_subcommand("ctl", "Ask the running daemon: devices, properties, gestures, recordings");
-    ctlCommand->add_option("--bus", ctl.bus, "system, session or a D-Bus address")->capture_default_str();
+    ctlCommand->add_option("--bus", ctl.bus, "system, session or a D-Bus address")
+        ->capture_default_str()
+        ->check(busCheck());
     ctlCommand->fallthrough();
     ctlCommand->require_subcommand(1);
     const auto ctlAction = [&](const char* name, const char* description, CtlCommand::Action action) {
@@ -252,10 +269,12 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
         ->add_option("KEY=VALUE", ctl.assignment, "VALUE is JSON")
         ->required()
         ->check(argumentCheck("KEY=JSON", [](const std::string& argument) { StateArguments::split(argument); }));
-    ctlAction("events", "Print gestures as they happen, until interrupted", CtlCommand::Action::Events)
-        ->add_flag("--jsonl", ctl.jsonLines, "One JSON object per line");
+    auto* ctlEvents = ctlAction("events", "Print gestures as they happen, until interrupted (or the daemon stops)",
+                                CtlCommand::Action::Events);
+    ctlEvents->add_flag("--jsonl", ctl.jsonLines, "One JSON object per line");
+    ctlEvents->add_flag("--follow", ctl.follow, "Go on when the daemon stops, and wait for it to come back");
     ctlAction("save-recording", "Write a device's recording to a file", CtlCommand::Action::SaveRecording)
-        ->add_option("OUT", ctl.output, "File to write (as the daemon's user)")
+        ->add_option("OUT", ctl.output, "File to write (opened here, with your rights)")
         ->required();
     ReportCommand::Options report;
     std::vector<std::string> reportSets;
@@ -335,7 +354,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
         } else if (*daemonCommand) {
             return DaemonCommand::run(daemon);
         } else if (*ctlCommand) {
-            return CtlCommand::run(ctl, out);
+            return CtlCommand::run(ctl, out, err);
         }
     } catch (const std::exception& error) {
         err << "veltotouch: " << error.what() << '\n';

@@ -1,15 +1,17 @@
 #include "CtlCommand.h"
 
 #include "EventFormatter.h"
+#include "OutputFile.h"
 #include "StateArguments.h"
 #include "ToolError.h"
 #include "host/BusService.h"
 #include "host/ControlClient.h"
 #include "host/StopSignals.h"
+#include "recording/JsonValue.h"
 
 #include <charconv>
 #include <chrono>
-#include <filesystem>
+#include <ostream>
 #include <string_view>
 #include <vector>
 
@@ -18,6 +20,7 @@ namespace VeltoTool {
 using VeltoHost::BusConnection;
 using VeltoHost::BusService;
 using VeltoHost::ControlClient;
+using VeltoHost::PropertyValue;
 
 namespace {
 
@@ -26,6 +29,7 @@ constexpr std::string_view kUnknownMethod = "org.freedesktop.DBus.Error.UnknownM
 constexpr std::string_view kServiceUnknown = "org.freedesktop.DBus.Error.ServiceUnknown";
 constexpr std::string_view kNameHasNoOwner = "org.freedesktop.DBus.Error.NameHasNoOwner";
 constexpr std::string_view kAccessDenied = "org.freedesktop.DBus.Error.AccessDenied";
+constexpr std::string_view kBusPolicyRefusal = "Rejected send message";
 
 // The number N of ".../device/N"; empty for any other object.
 std::optional<unsigned> deviceNumber(std::string_view path)
@@ -61,6 +65,8 @@ public:
                             " is attached ('veltotouch ctl devices' lists them)");
         }
         if (reply.error == kAccessDenied) {
+            // The bus's own refusal names rules, not reasons; the daemon's says why.
+            if (!reply.message.starts_with(kBusPolicyRefusal)) throw ToolError(reply.message);
             throw ToolError(reply.message + " (writing properties and saving recordings takes root or the "
                             "veltotouch group)");
         }
@@ -98,7 +104,11 @@ private:
     ControlClient _client;
 };
 
-int watchEvents(Session& session, const CtlCommand::Options& options, std::ostream& out)
+// Prints the daemon's gestures until interrupted. Only the owner of the
+// service's name is listened to (ControlClient), and when it leaves the bus
+// the watch ends: the next daemon numbers its devices anew, so its device 1
+// need not be the one asked for.
+int watchEvents(Session& session, const CtlCommand::Options& options, std::ostream& out, std::ostream& err)
 {
     using VeltoHost::StopSignals;
     const StopSignals stopSignals;
@@ -107,17 +117,30 @@ int watchEvents(Session& session, const CtlCommand::Options& options, std::ostre
     // A call after the match is in place: the device exists, and no signal
     // sent from here on is missed.
     std::string watched;
-    if (options.device) {
+    if (client.owner().empty() && options.follow) {
+        err << "veltotouch: the daemon is not running; waiting for it" << std::endl;
+    } else if (options.device) {
         watched = session.devicePath();
         session.checked(client.name(watched), watched);
     } else {
         session.devices();
     }
+    if (options.device) watched = BusService::devicePath(*options.device);
 
     EventFormatter formatter(options.jsonLines);
     bool haveOrigin = false;
     auto printNew = [&] {
         for (const ControlClient::Signal& signal : client.signals()) {
+            if (signal.member == "NameOwnerChanged") {
+                if (!options.follow && signal.object.empty()) {
+                    out.flush();
+                    throw ToolError(std::string("the daemon stopped (") + BusService::kBusName + " left the bus)");
+                }
+                err << (signal.object.empty() ? "veltotouch: the daemon stopped; waiting for it to come back"
+                                              : "veltotouch: the daemon is running again; its devices are numbered anew")
+                    << std::endl;
+                continue;
+            }
             if (signal.member != "Gesture" && signal.member != "DeviceReset") continue;
             if (!watched.empty() && signal.path != watched) continue;
             if (!haveOrigin) {
@@ -138,9 +161,29 @@ int watchEvents(Session& session, const CtlCommand::Options& options, std::ostre
     return 0;
 }
 
+// Says when a value reads back other than it was written: the plug-in keeps
+// a number beyond a setting's range as infinity, which reads back as null.
+void warnOfReadBack(Session& session, const std::string& path, const std::string& key, const std::string& text,
+                    std::ostream& err)
+{
+    using VeltoTouch::JsonValue;
+    const ControlClient::Reply readBack = session.client().getProperty(path, key);
+    if (!readBack.ok()) return;  // a command such as a reset: nothing to compare
+    const PropertyValue written = JsonValue::parse(text, JsonValue::TopLevel::AnyValue);
+    const PropertyValue value = JsonValue::parse(readBack.value, JsonValue::TopLevel::AnyValue);
+    if (written.isNumber() && value.isNull()) {
+        err << "veltotouch: warning: " << key << " was set to " << written.description()
+            << " but reads back null: beyond what the setting can hold, it became infinity\n";
+        return;
+    }
+    if (auto warning = StateArguments::readBackWarning(key, written, value)) {
+        err << "veltotouch: warning: " << *warning << '\n';
+    }
+}
+
 }  // namespace
 
-int CtlCommand::run(const Options& options, std::ostream& out)
+int CtlCommand::run(const Options& options, std::ostream& out, std::ostream& err)
 {
     Session session(options);
     ControlClient& client = session.client();
@@ -161,16 +204,19 @@ int CtlCommand::run(const Options& options, std::ostream& out)
         const auto [key, value] = StateArguments::split(options.assignment);
         const std::string path = session.devicePath();
         session.checked(client.setProperty(path, key, value), path);
+        warnOfReadBack(session, path, key, value, err);
         return 0;
     }
     case Action::SaveRecording: {
-        // The daemon runs elsewhere, in another directory: it needs the whole path.
-        const std::string file = std::filesystem::absolute(options.output).lexically_normal().string();
+        // Opened here, with the caller's rights and relative to the caller's
+        // directory; the daemon only writes into it.
         const std::string path = session.devicePath();
-        session.checked(client.saveRecording(path, file), path);
+        OutputFile file(options.output);
+        session.checked(client.saveRecording(path, file.descriptor()), path);
+        file.commit();
         return 0;
     }
-    case Action::Events: return watchEvents(session, options, out);
+    case Action::Events: return watchEvents(session, options, out, err);
     }
     return 0;
 }

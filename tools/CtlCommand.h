@@ -22,11 +22,13 @@ public:
         std::string assignment;          // Set: KEY=VALUE
         std::string output;              // SaveRecording
         bool jsonLines = false;          // Events
+        bool follow = false;             // Events: go on across a restart of the daemon
     };
 
     // Returns the exit status; throws ToolError when the daemon cannot be
-    // reached or refuses a request.
-    static int run(const Options& options, std::ostream& out);
+    // reached or refuses a request, and when it stops while its events are
+    // watched (unless `follow`). Warnings and notices go to `err`.
+    static int run(const Options& options, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

@@ -60,8 +60,12 @@ std::pair<std::string, std::string> StateArguments::split(const std::string& arg
 VeltoHost::PropertyValue StateArguments::parseValue(const std::string& key, const std::string& text)
 {
     using VeltoTouch::JsonValue;
-    VeltoHost::PropertyValue value = JsonValue::parse(text, JsonValue::TopLevel::AnyValue);
+    JsonValue::Problem problem = JsonValue::Problem::None;
+    VeltoHost::PropertyValue value = JsonValue::parse(text, JsonValue::TopLevel::AnyValue, problem);
     if (value.hasValue()) return value;
+    if (problem == JsonValue::Problem::NumberOutOfRange || problem == JsonValue::Problem::TooDeep) {
+        throw ToolError("value of " + key + " is " + JsonValue::describe(problem));
+    }
     const bool looksLikeJson = !text.empty() && std::string("{[\"-0123456789").find(text.front()) != std::string::npos;
     if (looksLikeJson || text.empty()) throw ToolError("value of " + key + " is not valid JSON: " + text);
     return VeltoHost::PropertyValue::string(text);

@@ -77,6 +77,13 @@ BusConnection::Address BusConnection::Address::parse(const std::string& text)
 {
     if (text == "system") return system();
     if (text == "session") return session();
+    // Every D-Bus address starts with its transport: "unix:", "tcp:", ...
+    const auto colon = text.find(':');
+    if (colon == std::string::npos || colon == 0) {
+        throw std::invalid_argument("\"" + text +
+                                    "\" is not a bus: give system, session or a D-Bus address such as "
+                                    "unix:path=/run/dbus/system_bus_socket");
+    }
     return at(text);
 }
 
@@ -220,6 +227,7 @@ bool BusConnection::processIncoming()
         if (result == 0) return false;
         if (result < 0) {
             _broken = true;
+            _lost = true;
             busLog().error("connection to %s lost: %s; the service no longer answers", _description,
                            errorText(result));
             return false;

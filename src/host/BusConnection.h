@@ -24,8 +24,9 @@ namespace VeltoHost {
 //
 // Jobs run one at a time, in the order they were posted, interleaved with
 // incoming calls; a job or handler that takes long holds up the others.
-// When the connection to the bus breaks, the failure is logged once and jobs
-// keep running (their sends fail quietly), so that no caller waits forever.
+// When the connection to the bus breaks, the failure is logged once, lost()
+// turns true, and jobs keep running (their sends fail quietly), so that no
+// caller waits forever; the owner decides what a service without its bus does.
 class BusConnection {
 public:
     // Where to connect: the system bus, the caller's session bus, or a bus
@@ -38,7 +39,8 @@ public:
         static Address system() { return {Kind::System, {}}; }
         static Address session() { return {Kind::Session, {}}; }
         static Address at(std::string address) { return {Kind::Address, std::move(address)}; }
-        // "system", "session", or anything else taken as an address.
+        // "system", "session", or an address ("TRANSPORT:KEY=VALUE,...");
+        // raises std::invalid_argument for anything else.
         static Address parse(const std::string& text);
         std::string description() const;
     };
@@ -75,6 +77,8 @@ public:
     void call(const std::function<void()>& job);
 
     bool isCurrent() const noexcept { return std::this_thread::get_id() == _threadId.load(); }
+    // True once the connection to the bus has broken; it never comes back.
+    bool lost() const noexcept { return _lost.load(); }
 
 private:
     void serve();
@@ -92,6 +96,7 @@ private:
     std::thread _thread;
     std::atomic<std::thread::id> _threadId{};
     bool _broken = false;  // connection's thread only
+    std::atomic<bool> _lost{false};
 
     std::mutex _jobsLock;
     // Guarded by _jobsLock.

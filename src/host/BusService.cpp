@@ -4,12 +4,20 @@
 #include "platform/Log.h"
 #include "recording/JsonValue.h"
 
+#include <fcntl.h>
+#include <sched.h>
+#include <sys/resource.h>
 #include <systemd/sd-bus.h>
+#include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <exception>
+#include <iterator>
 #include <stdexcept>
+#include <string_view>
+#include <utility>
 
 namespace VeltoHost {
 
@@ -18,6 +26,8 @@ namespace {
 // A value quoted back in an error is cut here: the caller sent it and only
 // needs enough to recognise it.
 constexpr std::size_t kQuotedValueLimit = 80;
+// How far the worker thread stands back (nice value).
+constexpr int kWorkerNice = 10;
 
 const Log& busLog()
 {
@@ -27,21 +37,43 @@ const Log& busLog()
 
 std::string errorText(int negativeErrno) { return std::strerror(-negativeErrno); }
 
-std::string shortened(const std::string& text)
+std::string shortened(std::string_view text)
 {
-    if (text.size() <= kQuotedValueLimit) return text;
-    return text.substr(0, kQuotedValueLimit) + "...";
+    if (text.size() <= kQuotedValueLimit) return std::string(text);
+    return std::string(text.substr(0, kQuotedValueLimit)) + "...";
 }
+
+std::string quoted(std::string_view text) { return "'" + shortened(text) + "'"; }
+
+// A descriptor the worker writes a recording to, closed when the request is done.
+struct Descriptor {
+    explicit Descriptor(int fd) : fd(fd) {}
+    ~Descriptor()
+    {
+        if (fd >= 0) ::close(fd);
+    }
+    Descriptor(const Descriptor&) = delete;
+    Descriptor& operator=(const Descriptor&) = delete;
+    const int fd;
+};
+
+// The worker yields to everything else: the input-report threads, the
+// host's queues and the connection's thread all come first, so a burst of
+// recording reads only ever takes time nothing else wanted.
+void lowerWorkerPriority()
+{
+    sched_param parameters{};
+    ::sched_setscheduler(0, SCHED_BATCH, &parameters);
+    ::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), kWorkerNice);
+}
+
+// Client user ids remembered before the list starts again.
+constexpr std::size_t kMaxRememberedClients = 1024;
 
 const char* errorName(DeviceControl::Status status)
 {
     return status == DeviceControl::Status::InvalidArgument ? BusService::kErrorInvalidArgument
                                                             : BusService::kErrorFailed;
-}
-
-int replyWith(sd_bus_error* error, const DeviceControl::Result& result)
-{
-    return sd_bus_error_set(error, errorName(result.status), result.message.c_str());
 }
 
 // Every handler runs inside sd-bus's C code: nothing may unwind through it.
@@ -84,11 +116,21 @@ struct BusService::Handlers {
             const char* key = nullptr;
             int result = sd_bus_message_read(call, "s", &key);
             if (result < 0) return result;
-            PropertyValue value;
-            const DeviceControl::Result outcome = device(userdata).control->getProperty(key, value);
-            if (!outcome.isOk()) return replyWith(error, outcome);
-            const std::string text = VeltoTouch::JsonValue::write(value, false);
-            return sd_bus_reply_method_return(call, "s", text.c_str());
+            BusService& service = self(userdata);
+            std::optional<uid_t> uid;
+            const bool rawData = isRawDataKey(key);
+            if (rawData) {
+                uid = service.callerUid(call);
+                if (!uid) return sd_bus_error_set(error, SD_BUS_ERROR_ACCESS_DENIED, "the caller's user is unknown");
+            }
+            return service.queueRequest(call, userdata, error,
+                                        [&service, key = std::string(key), uid](DeviceControl& control) {
+                if (uid && !service._access.allows(*uid)) return service.rawDataRefusal("reading " + quoted(key));
+                PropertyValue value;
+                const DeviceControl::Result outcome = control.getProperty(key, value);
+                if (!outcome.isOk()) return answerOf(outcome);
+                return Answer{{}, {}, VeltoTouch::JsonValue::write(value, false)};
+            });
         });
     }
 
@@ -99,26 +141,45 @@ struct BusService::Handlers {
             const char* text = nullptr;
             int result = sd_bus_message_read(call, "ss", &key, &text);
             if (result < 0) return result;
-            const PropertyValue value = VeltoTouch::JsonValue::parse(text, VeltoTouch::JsonValue::TopLevel::AnyValue);
-            if (!value.hasValue()) {
-                return sd_bus_error_setf(error, kErrorInvalidJson, "the value for '%s' is not JSON: %s", key,
-                                         shortened(text).c_str());
+            const std::size_t size = std::strlen(text);
+            if (size > kMaxValueBytes) {
+                return sd_bus_error_setf(error, kErrorInvalidArgument,
+                                         "the value for %s is %zu bytes long; no setting takes more than %zu",
+                                         quoted(key).c_str(), size, kMaxValueBytes);
             }
-            const DeviceControl::Result outcome = device(userdata).control->setProperty(key, value);
-            if (!outcome.isOk()) return replyWith(error, outcome);
-            return sd_bus_reply_method_return(call, "");
+            return self(userdata).queueRequest(call, userdata, error,
+                                               [key = std::string(key), text = std::string(text)](DeviceControl& control) {
+                VeltoTouch::JsonValue::Problem problem = VeltoTouch::JsonValue::Problem::None;
+                const PropertyValue value =
+                    VeltoTouch::JsonValue::parse(text, VeltoTouch::JsonValue::TopLevel::AnyValue, problem);
+                if (!value.hasValue()) {
+                    return Answer{problem == VeltoTouch::JsonValue::Problem::NotJson ? kErrorInvalidJson
+                                                                                     : kErrorInvalidArgument,
+                                  "the value for " + quoted(key) + " is " + VeltoTouch::JsonValue::describe(problem) +
+                                      ": " + shortened(text),
+                                  {}};
+                }
+                return answerOf(control.setProperty(key, value));
+            });
         });
     }
 
     static int saveRecording(sd_bus_message* call, void* userdata, sd_bus_error* error)
     {
         return guarded(error, [&] {
-            const char* path = nullptr;
-            int result = sd_bus_message_read(call, "s", &path);
+            int passed = -1;
+            int result = sd_bus_message_read(call, "h", &passed);
             if (result < 0) return result;
-            const DeviceControl::Result outcome = device(userdata).control->saveRecording(path);
-            if (!outcome.isOk()) return replyWith(error, outcome);
-            return sd_bus_reply_method_return(call, "");
+            BusService& service = self(userdata);
+            const std::optional<uid_t> uid = service.callerUid(call);
+            if (!uid) return sd_bus_error_set(error, SD_BUS_ERROR_ACCESS_DENIED, "the caller's user is unknown");
+            // The message owns the descriptor it carried; the worker gets its own.
+            auto file = std::make_shared<Descriptor>(::fcntl(passed, F_DUPFD_CLOEXEC, 3));
+            if (file->fd < 0) return sd_bus_error_set_errno(error, errno);
+            return service.queueRequest(call, userdata, error, [&service, uid, file](DeviceControl& control) {
+                if (!service._access.allows(*uid)) return service.rawDataRefusal("saving a recording");
+                return answerOf(control.saveRecording(file->fd));
+            });
         });
     }
 
@@ -129,13 +190,25 @@ struct BusService::Handlers {
     }
 
     static DeviceObject& device(void* userdata) { return *static_cast<DeviceObject*>(userdata); }
+    static BusService& self(void* userdata) { return *device(userdata).service; }
+
+    static Answer answerOf(const DeviceControl::Result& result)
+    {
+        if (result.isOk()) return {};
+        return {errorName(result.status), result.message, {}};
+    }
+
+    static bool isRawDataKey(std::string_view key)
+    {
+        return std::find(std::begin(kRawDataKeys), std::end(kRawDataKeys), key) != std::end(kRawDataKeys);
+    }
 };
 
 namespace {
 
-// Access is the bus policy's business (packaging/): every method is marked
-// unprivileged so that sd-bus does not add a capability check of its own on
-// the system bus.
+// Every method is marked unprivileged so that sd-bus does not add a
+// capability check of its own on the system bus: the bus policy
+// (packaging/) and RawDataAccess decide.
 const sd_bus_vtable kManagerVtable[] = {
     SD_BUS_VTABLE_START(0),
     SD_BUS_METHOD_WITH_NAMES("ListDevices", "", "", "ao", SD_BUS_PARAM(devices), BusService::Handlers::listDevices,
@@ -152,7 +225,7 @@ const sd_bus_vtable kDeviceVtable[] = {
                              BusService::Handlers::getProperty, SD_BUS_VTABLE_UNPRIVILEGED),
     SD_BUS_METHOD_WITH_NAMES("SetProperty", "ss", SD_BUS_PARAM(key) SD_BUS_PARAM(value), "", "",
                              BusService::Handlers::setProperty, SD_BUS_VTABLE_UNPRIVILEGED),
-    SD_BUS_METHOD_WITH_NAMES("SaveRecording", "s", SD_BUS_PARAM(path), "", "", BusService::Handlers::saveRecording,
+    SD_BUS_METHOD_WITH_NAMES("SaveRecording", "h", SD_BUS_PARAM(file), "", "", BusService::Handlers::saveRecording,
                              SD_BUS_VTABLE_UNPRIVILEGED),
     SD_BUS_SIGNAL_WITH_NAMES("Gesture", "ssuuuit",
                              SD_BUS_PARAM(gesture) SD_BUS_PARAM(region) SD_BUS_PARAM(frame) SD_BUS_PARAM(phase)
@@ -164,8 +237,10 @@ const sd_bus_vtable kDeviceVtable[] = {
 
 }  // namespace
 
-BusService::BusService(const BusConnection::Address& address) : _connection(address)
+BusService::BusService(const BusConnection::Address& address, RawDataAccess access)
+    : _access(std::move(access)), _connection(address), _worker(SerialQueue::create("bus requests"))
 {
+    _worker->async(lowerWorkerPriority);
     // Objects first, name last: a client that sees the name appear finds
     // the manager already there.
     try {
@@ -182,6 +257,12 @@ BusService::BusService(const BusConnection::Address& address) : _connection(addr
 
 BusService::~BusService()
 {
+    // Requests still queued find their devices closed and are answered; the
+    // answers go out before the connection closes.
+    _connection.call([this] {
+        for (auto& [id, device] : _devices) closeGate(*device->gate);
+    });
+    _worker.reset();
     _connection.stop();
     for (auto& [id, device] : _devices) sd_bus_slot_unref(device->slot);
     _devices.clear();
@@ -225,7 +306,9 @@ BusService::DeviceId BusService::addDevice(std::shared_ptr<DeviceControl> contro
         device->id = _nextDeviceId;
         device->path = devicePath(device->id);
         device->name = control->name();
-        device->control = control;
+        device->gate = std::make_shared<ControlGate>();
+        device->gate->control = control;
+        device->service = this;
         const int result = sd_bus_add_object_vtable(_connection.bus(), &device->slot, device->path.c_str(),
                                                     kDeviceInterface, kDeviceVtable, device.get());
         if (result < 0) throw std::runtime_error("cannot serve " + device->path + ": " + errorText(result));
@@ -244,10 +327,100 @@ void BusService::removeDevice(DeviceId id)
         auto found = _devices.find(id);
         if (found == _devices.end()) return;
         const std::string path = found->second->path;
+        // After this no worker job reaches the control; one in progress has ended.
+        closeGate(*found->second->gate);
         sd_bus_slot_unref(found->second->slot);
         _devices.erase(found);
         emitManagerSignal("DeviceRemoved", path);
     });
+}
+
+void BusService::closeGate(ControlGate& gate)
+{
+    std::lock_guard guard(gate.lock);
+    gate.control.reset();
+}
+
+int BusService::queueRequest(sd_bus_message* call, void* device, sd_bus_error* error, Work work)
+{
+    const char* sender = sd_bus_message_get_sender(call);
+    std::string client = sender ? sender : "";
+    std::size_t& pending = _requestsByClient[client];
+    if (pending >= kMaxRequestsPerClient || _requests >= kMaxRequests) {
+        if (pending == 0) _requestsByClient.erase(client);
+        return sd_bus_error_setf(error, SD_BUS_ERROR_LIMITS_EXCEEDED,
+                                 "too many requests in progress (at most %zu per client): wait for the answers",
+                                 kMaxRequestsPerClient);
+    }
+    ++pending;
+    ++_requests;
+    sd_bus_message_ref(call);
+    std::shared_ptr<ControlGate> gate = Handlers::device(device).gate;
+    const std::string name = Handlers::device(device).name;
+    _worker->async([this, call, client = std::move(client), gate = std::move(gate), name, work = std::move(work)] {
+        Answer answer;
+        {
+            std::lock_guard guard(gate->lock);
+            if (!gate->control) {
+                answer = {kErrorFailed, "device " + name + " was removed", {}};
+            } else {
+                try {
+                    answer = work(*gate->control);
+                } catch (const std::exception& failure) {
+                    busLog().error("bus request failed: %s", failure.what());
+                    answer = {kErrorFailed, std::string("internal error: ") + failure.what(), {}};
+                }
+            }
+        }
+        // The worker ends before the connection stops, so the answer always
+        // reaches the connection's thread, which alone may touch the message.
+        _connection.post([this, call, client, answer = std::move(answer)] { sendAnswer(call, client, answer); });
+    });
+    return 1;  // answered later
+}
+
+void BusService::sendAnswer(sd_bus_message* call, const std::string& client, const Answer& answer)
+{
+    int result = 0;
+    if (!answer.error.empty()) {
+        sd_bus_error error = SD_BUS_ERROR_MAKE_CONST(answer.error.c_str(), answer.message.c_str());
+        result = sd_bus_reply_method_error(call, &error);
+    } else if (answer.value) {
+        result = sd_bus_reply_method_return(call, "s", answer.value->c_str());
+    } else {
+        result = sd_bus_reply_method_return(call, "");
+    }
+    if (result < 0) busLog().debug("cannot answer %s: %s", client, errorText(result));
+    sd_bus_message_unref(call);
+    --_requests;
+    auto found = _requestsByClient.find(client);
+    if (found != _requestsByClient.end() && --found->second == 0) _requestsByClient.erase(found);
+}
+
+std::optional<uid_t> BusService::callerUid(sd_bus_message* call)
+{
+    const char* sender = sd_bus_message_get_sender(call);
+    if (!sender) return std::nullopt;
+    if (auto known = _clientUids.find(sender); known != _clientUids.end()) return known->second;
+    sd_bus_creds* creds = nullptr;
+    uid_t uid = 0;
+    const int result = sd_bus_query_sender_creds(call, SD_BUS_CREDS_EUID | SD_BUS_CREDS_UID, &creds);
+    const bool found = result >= 0 && (sd_bus_creds_get_euid(creds, &uid) >= 0 || sd_bus_creds_get_uid(creds, &uid) >= 0);
+    sd_bus_creds_unref(creds);
+    if (!found) {
+        busLog().error("cannot tell the user of %s: %s", sender, errorText(result < 0 ? result : -ENODATA));
+        return std::nullopt;
+    }
+    // Bounded: clients come and go for as long as the service runs.
+    if (_clientUids.size() >= kMaxRememberedClients) _clientUids.clear();
+    _clientUids.emplace(sender, uid);
+    return uid;
+}
+
+BusService::Answer BusService::rawDataRefusal(const std::string& what) const
+{
+    return {SD_BUS_ERROR_ACCESS_DENIED,
+            what + " is kept to root and the group " + _access.group() + ": it holds the raw touch data", {}};
 }
 
 void BusService::emitManagerSignal(const char* member, const std::string& path)

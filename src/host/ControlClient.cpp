@@ -44,6 +44,7 @@ ControlClient::ControlClient(const BusConnection::Address& address)
 ControlClient::~ControlClient()
 {
     sd_bus_slot_unref(_match);
+    sd_bus_slot_unref(_ownerMatch);
     sd_bus_flush_close_unref(_bus);
 }
 
@@ -83,9 +84,17 @@ ControlClient::Reply ControlClient::setProperty(const std::string& path, const s
     return call(path, BusService::kDeviceInterface, "SetProperty", {key, json});
 }
 
-ControlClient::Reply ControlClient::saveRecording(const std::string& path, const std::string& file)
+ControlClient::Reply ControlClient::saveRecording(const std::string& path, int file)
 {
-    return call(path, BusService::kDeviceInterface, "SaveRecording", {file});
+    sd_bus_message* answer = nullptr;
+    sd_bus_error error{};  // all null: no error set
+    const int result = sd_bus_call_method(_bus, BusService::kBusName, path.c_str(), BusService::kDeviceInterface,
+                                          "SaveRecording", &error, &answer, "h", file);
+    Reply reply = replyOf(result, error);
+    sd_bus_error_free(&error);
+    sd_bus_message_unref(answer);
+    drain();
+    return reply;
 }
 
 std::vector<std::string> ControlClient::listDevices(Reply* failure)
@@ -124,13 +133,47 @@ ControlClient::Reply ControlClient::name(const std::string& path)
 
 bool ControlClient::watchSignals()
 {
+    // The owner's changes first, then its present owner: from here on no
+    // change is missed.
+    const std::string ownerRule = std::string("type='signal',sender='org.freedesktop.DBus',path='/org/freedesktop/DBus',"
+                                              "interface='org.freedesktop.DBus',member='NameOwnerChanged',arg0='") +
+                                  BusService::kBusName + "'";
+    if (sd_bus_add_match(_bus, &_ownerMatch, ownerRule.c_str(), &ControlClient::onOwnerChanged, this) < 0) return false;
+    sd_bus_message* answer = nullptr;
+    const char* owner = nullptr;
+    if (sd_bus_call_method(_bus, "org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus", "GetNameOwner",
+                           nullptr, &answer, "s", BusService::kBusName) >= 0 &&
+        sd_bus_message_read(answer, "s", &owner) >= 0 && owner) {
+        _owner = owner;
+    }
+    sd_bus_message_unref(answer);
     const std::string rule = std::string("type='signal',path_namespace='") + BusService::kManagerPath + "'";
     return sd_bus_add_match(_bus, &_match, rule.c_str(), &ControlClient::onSignal, this) >= 0;
+}
+
+int ControlClient::onOwnerChanged(sd_bus_message* message, void* userdata, sd_bus_error*)
+{
+    auto* self = static_cast<ControlClient*>(userdata);
+    const char* name = nullptr;
+    const char* previous = nullptr;
+    const char* owner = nullptr;
+    if (sd_bus_message_read(message, "sss", &name, &previous, &owner) < 0 || !owner) return 0;
+    if (self->_owner == owner) return 0;  // seen already, when the watch began
+    self->_owner = owner;
+    Signal signal;
+    signal.receivedTicks = MonotonicClock::now();
+    signal.member = "NameOwnerChanged";
+    signal.object = owner;
+    self->_signals.push_back(std::move(signal));
+    return 0;
 }
 
 int ControlClient::onSignal(sd_bus_message* message, void* userdata, sd_bus_error*)
 {
     auto* self = static_cast<ControlClient*>(userdata);
+    // Anyone may send a signal with the service's path: only its owner's count.
+    const char* sender = sd_bus_message_get_sender(message);
+    if (!sender || self->_owner.empty() || self->_owner != sender) return 0;
     Signal signal;
     signal.receivedTicks = MonotonicClock::now();
     signal.path = sd_bus_message_get_path(message) ? sd_bus_message_get_path(message) : "";

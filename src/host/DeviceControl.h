@@ -12,14 +12,14 @@ namespace VeltoHost {
 // speaks to devices only through this, so that it knows nothing of how a
 // device runs its plug-in.
 //
-// Calls come from one thread at a time (the bus service's own). None may
+// Calls come from one thread at a time (the bus service's worker). None may
 // throw: a refusal is a Result the caller turns into an answer.
 class DeviceControl {
 public:
     enum class Status {
         Ok,
-        // The request itself is wrong (unknown key, wrong kind of value, bad
-        // path); sending it again will not help.
+        // The request itself is wrong (unknown key, wrong kind of value, a
+        // file that cannot take a recording); sending it again will not help.
         InvalidArgument,
         // The request was well formed but the device could not carry it out.
         Failed,
@@ -42,8 +42,10 @@ public:
     // On success `value` holds the property's current value.
     virtual Result getProperty(const std::string& key, PropertyValue& value) = 0;
     virtual Result setProperty(const std::string& key, const PropertyValue& value) = 0;
-    // Writes the device's current recording to `path`.
-    virtual Result saveRecording(const std::string& path) = 0;
+    // Writes the device's current recording into `file`, a descriptor of a
+    // regular file open for writing, replacing what it held. The caller
+    // keeps the descriptor.
+    virtual Result saveRecording(int file) = 0;
 };
 
 }  // namespace VeltoHost

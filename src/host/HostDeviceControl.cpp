@@ -1,6 +1,7 @@
 #include "host/HostDeviceControl.h"
 
 #include "recording/JsonValue.h"
+#include "service/ServicePropertyKey.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -11,7 +12,7 @@
 #include <cstdint>
 #include <cstring>
 #include <limits>
-#include <vector>
+#include <optional>
 
 namespace VeltoHost {
 
@@ -21,8 +22,6 @@ constexpr const char* kRecordingKey = "Recording";
 constexpr const char* kPipelineDomain = "Pipeline.";
 // Keys that act when written and read as null: commands, not settings.
 constexpr const char* kWriteOnlyKeys[] = {"Pipeline.Algs.ResetEventStats"};
-// Recordings hold raw touch data: readable by the daemon's group, no one else.
-constexpr mode_t kRecordingFileMode = 0640;
 
 bool isWriteOnly(const std::string& key)
 {
@@ -32,7 +31,15 @@ bool isWriteOnly(const std::string& key)
     return false;
 }
 
-std::string quoted(const std::string& text) { return "'" + text + "'"; }
+// Keys are echoed back to whoever sent them, cut short: the sender needs
+// only enough to recognise what it sent.
+constexpr std::size_t kQuotedKeyLimit = 80;
+
+std::string quoted(const std::string& text)
+{
+    if (text.size() <= kQuotedKeyLimit) return "'" + text + "'";
+    return "'" + text.substr(0, kQuotedKeyLimit) + "...'";
+}
 
 bool isIntegerType(PropertyValue::NumberType type)
 {
@@ -82,34 +89,52 @@ bool fitsIntegerSetting(const PropertyValue& current, const PropertyValue& value
     }
 }
 
-std::string systemError(const std::string& path, int error) { return "cannot write " + quoted(path) + ": " + std::strerror(error); }
-
-// Writes beside the target and renames, so that a reader never finds half a
-// recording and a failed save leaves an earlier file as it was.
-DeviceControl::Result writeFileAtomically(const std::string& path, const std::string& text)
+std::string describeFileType(mode_t mode)
 {
-    std::vector<char> temporary(path.begin(), path.end());
-    for (char c : std::string(".XXXXXX")) temporary.push_back(c);
-    temporary.push_back('\0');
-    const int fd = ::mkostemp(temporary.data(), O_CLOEXEC);
-    if (fd < 0) return DeviceControl::Result::failed(systemError(path, errno));
-    int error = ::fchmod(fd, kRecordingFileMode) == 0 ? 0 : errno;
+    if (S_ISDIR(mode)) return "a directory";
+    if (S_ISCHR(mode)) return "a character device";
+    if (S_ISBLK(mode)) return "a block device";
+    if (S_ISFIFO(mode)) return "a pipe";
+    if (S_ISSOCK(mode)) return "a socket";
+    return "not a regular file";
+}
+
+// Why `file` cannot take a recording, or nothing. Only regular files: a
+// device node or a pipe could block the writer or go somewhere the caller
+// did not mean.
+std::optional<std::string> unsuitable(int file)
+{
+    struct stat status {};
+    if (::fstat(file, &status) != 0) return std::string("the file cannot be examined: ") + std::strerror(errno);
+    if (!S_ISREG(status.st_mode)) return "the file is " + describeFileType(status.st_mode) + ", not a regular file";
+    const int flags = ::fcntl(file, F_GETFL);
+    if (flags < 0 || (flags & O_ACCMODE) == O_RDONLY) return std::string("the file is not open for writing");
+    if (flags & O_APPEND) return std::string("the file is open for appending; open it for writing from the start");
+    return std::nullopt;
+}
+
+// The whole text at the start of `file`, and nothing after it.
+int writeWhole(int file, const std::string& text)
+{
+    if (::ftruncate(file, 0) != 0) return errno;
     std::size_t written = 0;
-    while (error == 0 && written < text.size()) {
-        const ssize_t count = ::write(fd, text.data() + written, text.size() - written);
+    while (written < text.size()) {
+        const ssize_t count = ::pwrite(file, text.data() + written, text.size() - written, static_cast<off_t>(written));
         if (count > 0) {
             written += static_cast<std::size_t>(count);
         } else if (count < 0 && errno != EINTR) {
-            error = errno;
+            return errno;
         }
     }
-    if (::close(fd) != 0 && error == 0) error = errno;
-    if (error == 0 && ::rename(temporary.data(), path.c_str()) != 0) error = errno;
-    if (error != 0) {
-        ::unlink(temporary.data());
-        return DeviceControl::Result::failed(systemError(path, error));
+    return 0;
+}
+
+bool isReadOnlyServiceKey(const std::string& key)
+{
+    for (const VeltoTouch::ServicePropertyKey& property : VeltoTouch::kServicePropertyKeys) {
+        if (key == property.name) return !property.writable;
     }
-    return DeviceControl::Result::ok();
+    return false;
 }
 
 }  // namespace
@@ -144,6 +169,8 @@ DeviceControl::Result HostDeviceControl::setProperty(const std::string& key, con
 {
     if (key.empty()) return Result::invalidArgument("the property key is empty");
     if (!_host.isRunning()) return Result::failed("device " + _name + " is not running");
+    // Before the current value is copied: "Recording" is large.
+    if (isReadOnlyServiceKey(key)) return Result::failed("property " + quoted(key) + " is read-only");
     if (!isWriteOnly(key)) {
         Result checked = checkWrite(key, copy(key), value);
         if (!checked.isOk()) return checked;
@@ -180,17 +207,16 @@ DeviceControl::Result HostDeviceControl::checkWrite(const std::string& key, cons
     return Result::ok();
 }
 
-DeviceControl::Result HostDeviceControl::saveRecording(const std::string& path)
+DeviceControl::Result HostDeviceControl::saveRecording(int file)
 {
-    if (path.empty()) return Result::invalidArgument("the path is empty");
-    // The daemon's working directory is no one's business; a relative path
-    // would land somewhere the caller did not mean.
-    if (path.front() != '/') return Result::invalidArgument("the path must be absolute, not " + quoted(path));
-    if (path.back() == '/') return Result::invalidArgument("the path names a directory: " + quoted(path));
+    if (const auto problem = unsuitable(file)) return Result::invalidArgument(*problem);
     if (!_host.isRunning()) return Result::failed("device " + _name + " is not running");
     const PropertyValue recording = copy(kRecordingKey);
     if (!recording.isString()) return Result::failed("device " + _name + " has no recording to save");
-    return writeFileAtomically(path, recording.asString());
+    if (const int error = writeWhole(file, recording.asString())) {
+        return Result::failed(std::string("cannot write the recording: ") + std::strerror(error));
+    }
+    return Result::ok();
 }
 
 }  // namespace VeltoHost

@@ -10,7 +10,7 @@ namespace VeltoHost {
 
 // The control of a device whose plug-in runs in a HostEventSystem: reads and
 // writes go to the plug-in's properties, a saved recording is the plug-in's
-// "Recording" property written to a file.
+// "Recording" property written into a file the caller opened.
 //
 // The plug-in takes any write and counts a value of the wrong kind as 0, so a
 // remote "ActivationThreshold" = "high" would silently switch the recogniser
@@ -18,7 +18,9 @@ namespace VeltoHost {
 // before they reach the plug-in: the key must be readable (or one of the few
 // write-only commands), the value of the same kind (a number may set a flag),
 // an integer setting takes only integers it can hold, and the recogniser's
-// dictionaries (counters, debug information) are read-only.
+// dictionaries (counters, debug information) and the service's own
+// read-only keys (Version, Recording, ...) are refused as read-only rather
+// than taken and ignored.
 //
 // The host must outlive this object, and must not be stopped while a call is
 // in progress: detach the control from whoever calls it (the bus service's
@@ -30,7 +32,7 @@ public:
     std::string name() const override { return _name; }
     Result getProperty(const std::string& key, PropertyValue& value) override;
     Result setProperty(const std::string& key, const PropertyValue& value) override;
-    Result saveRecording(const std::string& path) override;
+    Result saveRecording(int file) override;
 
     // The host's own write, unchecked, under the same serialisation as the
     // checked calls: for the daemon's other writers (a simulated device's

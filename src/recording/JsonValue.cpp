@@ -52,12 +52,33 @@ nlohmann::ordered_json numberToJson(const PropertyValue& value)
 
 PropertyValue JsonValue::parse(std::string_view text, TopLevel topLevel)
 {
+    Problem ignored = Problem::None;
+    return parse(text, topLevel, ignored);
+}
+
+PropertyValue JsonValue::parse(std::string_view text, TopLevel topLevel, Problem& problem)
+{
     PropertyValueBuilder builder(topLevel == TopLevel::AnyValue);
     if (!nlohmann::json::sax_parse(text.begin(), text.end(), &builder, nlohmann::json::input_format_t::json,
                                    /*strict=*/true, /*ignore_comments=*/false)) {
+        problem = builder.problem() == Problem::None ? Problem::NotJson : builder.problem();
         return {};
     }
+    problem = Problem::None;
     return builder.takeResult();
+}
+
+std::string JsonValue::describe(Problem problem)
+{
+    switch (problem) {
+    case Problem::None: return "valid JSON";
+    case Problem::NotJson: return "not JSON";
+    case Problem::NumberOutOfRange: return "JSON with a number out of range (beyond a 64-bit float)";
+    case Problem::TooDeep:
+        return "JSON nested deeper than " + std::to_string(kMaxNestingDepth) + " levels";
+    case Problem::ScalarAtTopLevel: return "JSON, but not an object or array at the top level";
+    }
+    return "not JSON";
 }
 
 nlohmann::ordered_json JsonValue::toJson(const PropertyValue& value)

@@ -40,6 +40,12 @@ public:
     // a scalar while `topLevel` asks for an object or array. Never throws
     // anything but std::bad_alloc.
     static PropertyValue parse(std::string_view text, TopLevel topLevel = TopLevel::ObjectOrArray);
+    // The same, saying why when the result is empty.
+    using Problem = PropertyValueBuilder::Problem;
+    static PropertyValue parse(std::string_view text, TopLevel topLevel, Problem& problem);
+    // What a problem is, in words for a message: "not JSON", "a number out
+    // of range", ...
+    static std::string describe(Problem problem);
 
     // The JSON form of a value. Never fails; for what JSON cannot hold:
     // - byte data is written as its hex text ("00 0a ff "), as report bytes are;

@@ -26,14 +26,20 @@ bool PropertyValueBuilder::end_array()
 
 bool PropertyValueBuilder::open(bool isObject)
 {
-    if (_levels.size() >= kMaxNestingDepth) return false;
+    if (_levels.size() >= kMaxNestingDepth) {
+        _problem = Problem::TooDeep;
+        return false;
+    }
     _levels.push_back(Level{isObject, {}, {}, {}});
     return true;
 }
 
 bool PropertyValueBuilder::scalar(PropertyValue value)
 {
-    if (_levels.empty() && !_scalarTopLevelAllowed) return false;
+    if (_levels.empty() && !_scalarTopLevelAllowed) {
+        _problem = Problem::ScalarAtTopLevel;
+        return false;
+    }
     return add(std::move(value));
 }
 

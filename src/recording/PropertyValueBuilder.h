@@ -26,10 +26,15 @@ class PropertyValueBuilder {
 public:
     static constexpr std::size_t kMaxNestingDepth = 512;
 
+    // Why a parse stopped, for messages that tell valid JSON the reader
+    // cannot hold apart from text that is not JSON at all.
+    enum class Problem { None, NotJson, NumberOutOfRange, TooDeep, ScalarAtTopLevel };
+
     // Whether a scalar alone is a complete document.
     explicit PropertyValueBuilder(bool scalarTopLevelAllowed) : _scalarTopLevelAllowed(scalarTopLevelAllowed) {}
 
     PropertyValue takeResult() { return std::move(_result); }
+    Problem problem() const noexcept { return _problem; }
 
     bool null() { return scalar(PropertyValue::null()); }
     bool boolean(bool value) { return scalar(PropertyValue::boolean(value)); }
@@ -59,8 +64,10 @@ public:
     bool end_array();
 
     template <typename Exception>
-    bool parse_error(std::size_t, const std::string&, const Exception&)
+    bool parse_error(std::size_t, const std::string&, const Exception& error)
     {
+        // The parser's out-of-range error (406) is a number beyond a double.
+        _problem = error.id == kNumberOverflowError ? Problem::NumberOutOfRange : Problem::NotJson;
         return false;
     }
 
@@ -75,7 +82,10 @@ private:
     bool open(bool isObject);
     bool add(PropertyValue value);
 
+    static constexpr int kNumberOverflowError = 406;
+
     bool _scalarTopLevelAllowed;
+    Problem _problem = Problem::None;
     std::vector<Level> _levels;
     PropertyValue _result;
 };

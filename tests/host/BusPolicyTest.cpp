@@ -7,6 +7,7 @@
 #include <gtest/gtest.h>
 #include <systemd/sd-bus.h>
 
+#include <fcntl.h>
 #include <grp.h>
 #include <pwd.h>
 #include <sys/wait.h>
@@ -29,8 +30,12 @@ constexpr const char* kAccessDenied = "org.freedesktop.DBus.Error.AccessDenied";
 // What an unprivileged client is expected to find, one bit each in the
 // child's exit code, in this order.
 const char* const kExpectations[] = {
-    "may call ListDevices",          "may call GetProperty",           "may read the Name property",
-    "is refused SetProperty",        "is refused SaveRecording",       "may not own the service's name",
+    "may call ListDevices",
+    "may call GetProperty",
+    "may read the Name property",
+    "is refused SetProperty and SaveRecording",
+    "is refused the raw touch data (Recording, ServicePluginDebug), with the daemon's reason",
+    "may not own the service's name",
     "receives the device's signals",
 };
 
@@ -61,8 +66,8 @@ bool receivesSignals(ControlClient& client, int readyFd, int goFd)
 }
 
 // Runs in the forked child, as `uid`/`gid`: no test macros, only the exit code.
-int probeAsUnprivileged(const std::string& address, const std::string& device, const std::string& file, uid_t uid,
-                        gid_t gid, int readyFd, int goFd)
+int probeAsUnprivileged(const std::string& address, const std::string& device, int file, uid_t uid, gid_t gid,
+                        int readyFd, int goFd)
 {
     if (::setgroups(0, nullptr) != 0 || ::setgid(gid) != 0 || ::setuid(uid) != 0 || ::getuid() != uid) return 0x80;
     ControlClient client(BusConnection::Address::at(address));
@@ -78,8 +83,13 @@ int probeAsUnprivileged(const std::string& address, const std::string& device, c
             return got.error.empty() && !got.value.empty();
         }(),
         client.name(device).value == "sim:policy.json",
-        client.setProperty(device, "Pipeline.Algs.HoldTimeoutMilliseconds", "1").error == kAccessDenied,
-        client.saveRecording(device, file).error == kAccessDenied,
+        client.setProperty(device, "Pipeline.Algs.HoldTimeoutMilliseconds", "1").error == kAccessDenied &&
+            client.saveRecording(device, file).error == kAccessDenied,
+        [&] {
+            const ControlClient::Reply got = client.getProperty(device, "Recording");
+            return got.error == kAccessDenied && got.message.find("raw touch data") != std::string::npos &&
+                   client.getProperty(device, "ServicePluginDebug").error == kAccessDenied;
+        }(),
         ownServiceName(address) == -EACCES,
         receivesSignals(client, readyFd, goFd),
     };
@@ -90,7 +100,7 @@ int probeAsUnprivileged(const std::string& address, const std::string& device, c
 
 }  // namespace
 
-TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwn)
+TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwnNorReadTheRawData)
 {
     if (::geteuid() != 0) {
         GTEST_SKIP() << "the policy check drops a child to an unprivileged user, which needs root; running as uid "
@@ -105,6 +115,8 @@ TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwn)
     BusService service(BusConnection::Address::at(bus.address()));
     AttachedDevice device(service, "sim:policy.json");
     const std::string file = bus.directory() + "/saved.json";
+    const int saved = ::open(file.c_str(), O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
+    ASSERT_GE(saved, 0) << std::strerror(errno);
 
     // Root may do everything the service offers.
     {
@@ -112,9 +124,10 @@ TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwn)
         ASSERT_TRUE(root.connected()) << root.connectError();
         EXPECT_EQ(root.setProperty(device.path(), "Pipeline.Algs.HoldTimeoutMilliseconds", "600").error, "");
         EXPECT_EQ(root.getProperty(device.path(), "Pipeline.Algs.HoldTimeoutMilliseconds").value, "600");
-        EXPECT_EQ(root.saveRecording(device.path(), file).error, "");
-        EXPECT_TRUE(std::filesystem::exists(file));
-        std::filesystem::remove(file);
+        EXPECT_EQ(root.getProperty(device.path(), "Recording").error, "");
+        EXPECT_EQ(root.saveRecording(device.path(), saved).error, "");
+        EXPECT_GT(std::filesystem::file_size(file), 0u);
+        ASSERT_EQ(::ftruncate(saved, 0), 0);
     }
 
     int ready[2];
@@ -123,7 +136,7 @@ TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwn)
     ASSERT_EQ(::pipe(go), 0);
     const pid_t child = ::fork();
     ASSERT_GE(child, 0) << std::strerror(errno);
-    if (child == 0) ::_exit(probeAsUnprivileged(bus.address(), device.path(), file, uid, gid, ready[1], go[0]));
+    if (child == 0) ::_exit(probeAsUnprivileged(bus.address(), device.path(), saved, uid, gid, ready[1], go[0]));
     ::close(ready[1]);
     ::close(go[0]);
     char signalled = 0;
@@ -147,5 +160,6 @@ TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwn)
     PropertyValue timeout;
     ASSERT_TRUE(device.control().getProperty("Pipeline.Algs.HoldTimeoutMilliseconds", timeout).isOk());
     EXPECT_EQ(timeout.toUInt64(), 600u);
-    EXPECT_FALSE(std::filesystem::exists(file));
+    EXPECT_EQ(std::filesystem::file_size(file), 0u);
+    ::close(saved);
 }

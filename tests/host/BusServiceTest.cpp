@@ -8,9 +8,14 @@
 
 #include <gtest/gtest.h>
 
-#include <sys/stat.h>
+#include <fcntl.h>
+#include <unistd.h>
 
+#include <algorithm>
+#include <condition_variable>
 #include <filesystem>
+#include <fstream>
+#include <mutex>
 #include <memory>
 #include <optional>
 #include <stdexcept>
@@ -109,7 +114,6 @@ TEST_F(BusServiceTest, MalformedRequestsAreRefusedWhileTheDeviceKeepsRecognising
     device.device()->setProperty("Product", PropertyValue::string("VeltoTouch"));
     const std::string path = device.path();
     const std::string absent = std::string(BusService::kDevicePathPrefix) + "41";
-    const std::string missingDirectory = "/nonexistent-velto-directory/out.json";
 
     struct Case {
         const char* what;
@@ -139,10 +143,18 @@ TEST_F(BusServiceTest, MalformedRequestsAreRefusedWhileTheDeviceKeepsRecognising
          BusService::kErrorInvalidArgument},
         {"counters are read-only", path, "SetProperty", {kCounters, "{}"}, BusService::kErrorFailed},
         {"device refuses the write", path, "SetProperty", {"Product", "\"renamed\""}, BusService::kErrorFailed},
-        {"empty path", path, "SaveRecording", {""}, BusService::kErrorInvalidArgument},
-        {"relative path", path, "SaveRecording", {"out.json"}, BusService::kErrorInvalidArgument},
-        {"directory path", path, "SaveRecording", {"/tmp/"}, BusService::kErrorInvalidArgument},
-        {"unwritable path", path, "SaveRecording", {missingDirectory}, BusService::kErrorFailed},
+        {"version is read-only", path, "SetProperty", {"Version", "[9,9,9]"}, BusService::kErrorFailed},
+        {"recording is read-only", path, "SetProperty", {"Recording", "\"x\""}, BusService::kErrorFailed},
+        {"debug dictionary is read-only", path, "SetProperty", {"ServicePluginDebug", "{}"}, BusService::kErrorFailed},
+        {"number beyond a double", path, "SetProperty", {"Pipeline.Algs.ActivationThreshold", "1e400"},
+         BusService::kErrorInvalidArgument},
+        {"nested too deep", path, "SetProperty",
+         {"Pipeline.Algs.ActivationThreshold", std::string(1000, '[') + std::string(1000, ']')},
+         BusService::kErrorInvalidArgument},
+        {"value larger than any setting", path, "SetProperty",
+         {"Pipeline.Algs.ActivationThreshold", std::string(BusService::kMaxValueBytes + 1, '1')},
+         BusService::kErrorInvalidArgument},
+        {"a path where a file is passed", path, "SaveRecording", {"/tmp/out.json"}, kInvalidArgs},
         {"absent device written", absent, "SetProperty", {"Pipeline.Algs.ActivationThreshold", "1"}, kUnknownObject},
         {"wrong argument count", path, "SetProperty", {"Pipeline.Algs.ActivationThreshold"}, kInvalidArgs},
         {"no such method", path, "Explode", {}, "org.freedesktop.DBus.Error.UnknownMethod"},
@@ -154,9 +166,12 @@ TEST_F(BusServiceTest, MalformedRequestsAreRefusedWhileTheDeviceKeepsRecognising
         const ControlClient::Reply reply = _client->call(c.path, BusService::kDeviceInterface, c.member, c.arguments);
         EXPECT_EQ(reply.error, c.error) << c.what << " (" << reply.message << ")";
         EXPECT_FALSE(reply.message.empty()) << c.what;
+        // What was sent is quoted back only in part.
+        EXPECT_LT(reply.message.size(), 300u) << c.what;
     }
     EXPECT_EQ(_client->getProperty(path, "Pipeline.Algs.ActivationThreshold").value, before);
-    EXPECT_FALSE(std::filesystem::exists(missingDirectory));
+    const std::string longKey(1 << 20, 'k');
+    EXPECT_LT(_client->getProperty(path, longKey).message.size(), 300u);
 
     // Still serving, still recognising.
     EXPECT_EQ(_client->listDevices(), (std::vector<std::string>{path}));
@@ -165,25 +180,42 @@ TEST_F(BusServiceTest, MalformedRequestsAreRefusedWhileTheDeviceKeepsRecognising
 }
 
 // That a saved file replays as the device played is checked through the real
-// daemon and `ctl save-recording`; here how the file lands.
-TEST_F(BusServiceTest, ASavedRecordingIsPrivateAndReplacedWhole)
+// daemon and `ctl save-recording`; here what the service writes into.
+TEST_F(BusServiceTest, ARecordingIsWrittenOnlyIntoARegularFileOpenForWriting)
 {
     AttachedDevice& device = attach("sim:taps.json");
-
-    const std::string directory = _bus.directory() + "/saved";  // removed with the bus
-    std::filesystem::create_directories(directory);
-    const std::string file = directory + "/session.json";
-    const ControlClient::Reply saved = _client->saveRecording(device.path(), file);
-    ASSERT_EQ(saved.error, "") << saved.message;
-
-    struct stat status {};
-    ASSERT_EQ(::stat(file.c_str(), &status), 0);
-    EXPECT_EQ(status.st_mode & 0777, 0640u);
-    // Saving again replaces the file whole and leaves nothing beside it.
-    ASSERT_EQ(_client->saveRecording(device.path(), file).error, "");
-    std::size_t entries = 0;
-    for ([[maybe_unused]] const auto& entry : std::filesystem::directory_iterator(directory)) ++entries;
-    EXPECT_EQ(entries, 1u);
+    device.play(example("taps.json"));
+    const std::string file = _bus.directory() + "/session.json";  // removed with the bus
+    {
+        std::ofstream longer(file);
+        longer << std::string(4 << 20, 'x');  // more than a recording: none of it may stay
+    }
+    int pipeEnds[2];
+    ASSERT_EQ(::pipe2(pipeEnds, O_CLOEXEC), 0);
+    struct Case {
+        const char* what;
+        int fd;
+        const char* error;
+    };
+    const Case cases[] = {
+        {"a character device", ::open("/dev/null", O_WRONLY | O_CLOEXEC), BusService::kErrorInvalidArgument},
+        {"a directory", ::open(_bus.directory().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC),
+         BusService::kErrorInvalidArgument},
+        {"a pipe", pipeEnds[1], BusService::kErrorInvalidArgument},
+        {"a file open for reading", ::open(file.c_str(), O_RDONLY | O_CLOEXEC), BusService::kErrorInvalidArgument},
+        {"a file open for appending", ::open(file.c_str(), O_WRONLY | O_APPEND | O_CLOEXEC),
+         BusService::kErrorInvalidArgument},
+        {"a file open for writing", ::open(file.c_str(), O_WRONLY | O_CLOEXEC), ""},
+    };
+    for (const Case& c : cases) {
+        ASSERT_GE(c.fd, 0) << c.what;
+        const ControlClient::Reply saved = _client->saveRecording(device.path(), c.fd);
+        EXPECT_EQ(saved.error, c.error) << c.what << ": " << saved.message;
+        ::close(c.fd);
+    }
+    ::close(pipeEnds[0]);
+    const VeltoTouch::PipelineRecording saved{std::string_view(readFile(file))};
+    EXPECT_FALSE(saved.frames().empty());
 }
 
 TEST_F(BusServiceTest, ASecondServiceIsRefusedTheNameAndAnAbsentBusIsNamed)
@@ -221,4 +253,109 @@ TEST_F(BusServiceTest, EventsOfARemovedDeviceAreNotSent)
     ASSERT_TRUE(_client->waitUntil([&] { return !_client->signalsNamed("DeviceAdded").empty() &&
                                                 _client->signalsNamed("DeviceAdded").back().object == other.path(); }));
     EXPECT_TRUE(_client->signalsNamed("DeviceReset").empty());
+}
+
+TEST_F(BusServiceTest, SignalsFromAnyoneButTheServiceAreNotTakenForItsOwn)
+{
+    AttachedDevice& device = attach("sim:taps.json");
+    // Another client on the bus sends what the device would.
+    sd_bus* impostor = BusConnection::connect(BusConnection::Address::at(_bus.address()));
+    ASSERT_GE(sd_bus_emit_signal(impostor, device.path().c_str(), BusService::kDeviceInterface, "DeviceReset", "t",
+                                 std::uint64_t{1}),
+              0);
+    sd_bus_flush_close_unref(impostor);
+    _service->publishEvent(device.id(), HidEvent::createVendorDefinedEvent(2, 0xFF60, 2, 0, nullptr, 0, 0));
+    ASSERT_TRUE(_client->waitUntil([&] { return !_client->signalsNamed("DeviceReset").empty(); }));
+    // The service's own came after the impostor's: had that one been taken, it would be first.
+    const auto resets = _client->signalsNamed("DeviceReset");
+    ASSERT_EQ(resets.size(), 1u);
+    EXPECT_EQ(resets[0].event.timestamp, 2u);
+}
+
+namespace {
+
+// A device whose every property read waits until the test lets it go: a
+// stand-in for a slow read of a large recording.
+class StalledControl final : public DeviceControl {
+public:
+    std::string name() const override { return "stalled"; }
+    Result getProperty(const std::string&, PropertyValue& value) override
+    {
+        std::unique_lock guard(_lock);
+        ++_entered;
+        _changed.notify_all();
+        _changed.wait(guard, [&] { return _released; });
+        value = PropertyValue::uint64(7);
+        return Result::ok();
+    }
+    Result setProperty(const std::string&, const PropertyValue&) override { return Result::ok(); }
+    Result saveRecording(int) override { return Result::ok(); }
+
+    void waitUntilEntered()
+    {
+        std::unique_lock guard(_lock);
+        _changed.wait(guard, [&] { return _entered > 0; });
+    }
+    void release()
+    {
+        std::lock_guard guard(_lock);
+        _released = true;
+        _changed.notify_all();
+    }
+
+private:
+    std::mutex _lock;
+    std::condition_variable _changed;
+    int _entered = 0;
+    bool _released = false;
+};
+
+}  // namespace
+
+TEST_F(BusServiceTest, ASlowDeviceReadHoldsUpNeitherSignalsNorListingAndEachClientIsBounded)
+{
+    auto stalled = std::make_shared<StalledControl>();
+    const BusService::DeviceId id = _service->addDevice(stalled);
+    const std::string path = BusService::devicePath(id);
+
+    // More reads than one client may have in progress, none waited for.
+    sd_bus* reader = BusConnection::connect(BusConnection::Address::at(_bus.address()));
+    std::vector<std::string> errors;
+    const auto answered = [](sd_bus_message* reply, void* userdata, sd_bus_error*) {
+        const sd_bus_error* error = sd_bus_message_get_error(reply);
+        static_cast<std::vector<std::string>*>(userdata)->push_back(error ? error->name : "");
+        return 0;
+    };
+    const std::size_t sent = BusService::kMaxRequestsPerClient + 2;
+    for (std::size_t i = 0; i < sent; ++i) {
+        ASSERT_GE(sd_bus_call_method_async(reader, nullptr, BusService::kBusName, path.c_str(),
+                                           BusService::kDeviceInterface, "GetProperty", answered, &errors, "s", "k"),
+                  0);
+    }
+    ASSERT_GE(sd_bus_flush(reader), 0);
+    stalled->waitUntilEntered();
+
+    // While the device is stuck, the bus goes on: signals, the device list,
+    // and the refusal of the reads beyond the client's share.
+    _service->publishEvent(id, HidEvent::createVendorDefinedEvent(3, 0xFF60, 2, 0, nullptr, 0, 0));
+    EXPECT_TRUE(_client->waitUntil([&] { return !_client->signalsNamed("DeviceReset").empty(); }));
+    EXPECT_EQ(_client->listDevices(), (std::vector<std::string>{path}));
+    // Reads the reader's answers until `count` have come.
+    const auto answersUntil = [&](std::size_t count) {
+        while (errors.size() < count) {
+            if (sd_bus_process(reader, nullptr) > 0) continue;
+            if (sd_bus_wait(reader, 5'000'000) <= 0) return false;
+        }
+        return true;
+    };
+    ASSERT_TRUE(answersUntil(sent - BusService::kMaxRequestsPerClient));
+    EXPECT_EQ(errors, std::vector<std::string>(sent - BusService::kMaxRequestsPerClient,
+                                               "org.freedesktop.DBus.Error.LimitsExceeded"));
+
+    // Once released, every read within the share is answered.
+    stalled->release();
+    ASSERT_TRUE(answersUntil(sent));
+    EXPECT_EQ(std::count(errors.begin(), errors.end(), ""), static_cast<long>(BusService::kMaxRequestsPerClient));
+    _service->removeDevice(id);
+    sd_bus_flush_close_unref(reader);
 }
