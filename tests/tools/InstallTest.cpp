@@ -5,7 +5,10 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdlib>
+#include <optional>
 #include <regex>
+#include <sstream>
 
 using namespace VeltoTool::Testing;
 
@@ -17,6 +20,23 @@ ToolProcess::Result install(const fs::path& root)
 {
     ToolProcess process({"--install", VELTO_BUILD_DIR},
                         ProcessSetup::copy(VELTO_CMAKE_COMMAND, {"DESTDIR=" + root.string()}));
+    return process.finish(kDeadline);
+}
+
+std::optional<fs::path> systemdAnalyze()
+{
+    const char* path = std::getenv("PATH");
+    std::istringstream directories(path ? path : "/usr/bin:/bin");
+    for (std::string directory; std::getline(directories, directory, ':');) {
+        const fs::path candidate = fs::path(directory) / "systemd-analyze";
+        if (!directory.empty() && ::access(candidate.c_str(), X_OK) == 0) return candidate;
+    }
+    return std::nullopt;
+}
+
+ToolProcess::Result analyze(const fs::path& program, const std::vector<std::string>& arguments)
+{
+    ToolProcess process(arguments, ProcessSetup::copy(program.string()));
     return process.finish(kDeadline);
 }
 
@@ -55,4 +75,38 @@ TEST(InstallTest, TheServiceFilesLandWhereTheUnitLooksAndTheConfigurationIsKept)
     const ToolProcess::Result again = install(root.path());
     ASSERT_TRUE(again.exited && again.status == 0) << again.err;
     EXPECT_EQ(readFile(config), "log_level = \"debug\"\n");
+}
+
+// The unit as installed, judged by systemd itself: it loads without a
+// complaint, and its sandbox leaves an exposure of 2.0 or less.
+TEST(InstallTest, TheInstalledUnitLoadsCleanlyAndStaysConfined)
+{
+    const std::optional<fs::path> systemdAnalyzer = systemdAnalyze();
+    if (!systemdAnalyzer) GTEST_SKIP() << "systemd-analyze is not installed (scripts/install-deps installs systemd)";
+    TempDir root;
+    const ToolProcess::Result installed = install(root.path());
+    ASSERT_TRUE(installed.exited && installed.status == 0) << installed.out << installed.err;
+
+    // verify wants the program where ExecStart names it, so that path moves
+    // into the scratch root; nothing else changes.
+    const fs::path prefix = root.path() / fs::path(VELTO_INSTALL_PREFIX).relative_path();
+    const std::string unit = readFile(prefix / "lib/systemd/system/veltotouch.service");
+    std::smatch exec;
+    ASSERT_TRUE(std::regex_search(unit, exec, std::regex("\nExecStart=(/\\S+) "))) << unit;
+    const std::string relocated = exec.prefix().str() + "\nExecStart=" +
+                                  (root.path() / fs::path(exec[1].str()).relative_path()).string() + " " +
+                                  exec.suffix().str();
+    const fs::path file = root.file("veltotouch.service", relocated);
+
+    const ToolProcess::Result verified = analyze(*systemdAnalyzer, {"verify", file.string()});
+    EXPECT_TRUE(verified.exited && verified.status == 0) << verified.out << verified.err;
+    EXPECT_EQ(verified.err.find("veltotouch.service"), std::string::npos) << verified.err;
+
+    const ToolProcess::Result assessed = analyze(*systemdAnalyzer, {"security", "--offline=true", file.string()});
+    ASSERT_TRUE(assessed.exited && assessed.status == 0) << assessed.err;
+    std::smatch exposure;
+    ASSERT_TRUE(std::regex_search(assessed.out, exposure,
+                                  std::regex("Overall exposure level for veltotouch\\.service: ([0-9]+\\.[0-9]+)")))
+        << assessed.out;
+    EXPECT_LE(std::stod(exposure[1].str()), 2.0) << assessed.out;
 }
