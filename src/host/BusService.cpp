@@ -12,11 +12,13 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cstring>
 #include <exception>
 #include <iterator>
 #include <stdexcept>
 #include <string_view>
+#include <thread>
 #include <utility>
 
 namespace VeltoHost {
@@ -123,7 +125,7 @@ struct BusService::Handlers {
                 uid = service.callerUid(call);
                 if (!uid) return sd_bus_error_set(error, SD_BUS_ERROR_ACCESS_DENIED, "the caller's user is unknown");
             }
-            return service.queueRequest(call, userdata, error,
+            return service.queueRequest(call, userdata, error, rawData ? Lane::RawData : Lane::Device,
                                         [&service, key = std::string(key), uid](DeviceControl& control) {
                 if (uid && !service._access.allows(*uid)) return service.rawDataRefusal("reading " + quoted(key));
                 PropertyValue value;
@@ -147,7 +149,7 @@ struct BusService::Handlers {
                                          "the value for %s is %zu bytes long; no setting takes more than %zu",
                                          quoted(key).c_str(), size, kMaxValueBytes);
             }
-            return self(userdata).queueRequest(call, userdata, error,
+            return self(userdata).queueRequest(call, userdata, error, Lane::Device,
                                                [key = std::string(key), text = std::string(text)](DeviceControl& control) {
                 VeltoTouch::JsonValue::Problem problem = VeltoTouch::JsonValue::Problem::None;
                 const PropertyValue value =
@@ -176,7 +178,8 @@ struct BusService::Handlers {
             // The message owns the descriptor it carried; the worker gets its own.
             auto file = std::make_shared<Descriptor>(::fcntl(passed, F_DUPFD_CLOEXEC, 3));
             if (file->fd < 0) return sd_bus_error_set_errno(error, errno);
-            return service.queueRequest(call, userdata, error, [&service, uid, file](DeviceControl& control) {
+            return service.queueRequest(call, userdata, error, Lane::RawData,
+                                        [&service, uid, file](DeviceControl& control) {
                 if (!service._access.allows(*uid)) return service.rawDataRefusal("saving a recording");
                 return answerOf(control.saveRecording(file->fd));
             });
@@ -238,9 +241,13 @@ const sd_bus_vtable kDeviceVtable[] = {
 }  // namespace
 
 BusService::BusService(const BusConnection::Address& address, RawDataAccess access)
-    : _access(std::move(access)), _connection(address), _worker(SerialQueue::create("bus requests"))
+    : _access(std::move(access)),
+      _connection(address),
+      _worker(SerialQueue::create("bus requests")),
+      _rawDataWorker(SerialQueue::create("bus raw data"))
 {
     _worker->async(lowerWorkerPriority);
+    _rawDataWorker->async(lowerWorkerPriority);
     // Objects first, name last: a client that sees the name appear finds
     // the manager already there.
     try {
@@ -262,6 +269,7 @@ BusService::~BusService()
     _connection.call([this] {
         for (auto& [id, device] : _devices) closeGate(*device->gate);
     });
+    _rawDataWorker.reset();
     _worker.reset();
     _connection.stop();
     for (auto& [id, device] : _devices) sd_bus_slot_unref(device->slot);
@@ -341,7 +349,7 @@ void BusService::closeGate(ControlGate& gate)
     gate.control.reset();
 }
 
-int BusService::queueRequest(sd_bus_message* call, void* device, sd_bus_error* error, Work work)
+int BusService::queueRequest(sd_bus_message* call, void* device, sd_bus_error* error, Lane lane, Work work)
 {
     const char* sender = sd_bus_message_get_sender(call);
     std::string client = sender ? sender : "";
@@ -357,7 +365,9 @@ int BusService::queueRequest(sd_bus_message* call, void* device, sd_bus_error* e
     sd_bus_message_ref(call);
     std::shared_ptr<ControlGate> gate = Handlers::device(device).gate;
     const std::string name = Handlers::device(device).name;
-    _worker->async([this, call, client = std::move(client), gate = std::move(gate), name, work = std::move(work)] {
+    SerialQueue& worker = lane == Lane::RawData ? *_rawDataWorker : *_worker;
+    worker.async([this, lane, call, client = std::move(client), gate = std::move(gate), name, work = std::move(work)] {
+        if (lane == Lane::RawData) waitForRawDataTurn(*gate);
         Answer answer;
         {
             std::lock_guard guard(gate->lock);
@@ -377,6 +387,18 @@ int BusService::queueRequest(sd_bus_message* call, void* device, sd_bus_error* e
         _connection.post([this, call, client, answer = std::move(answer)] { sendAnswer(call, client, answer); });
     });
     return 1;  // answered later
+}
+
+void BusService::waitForRawDataTurn(ControlGate& gate)
+{
+    {
+        // A device taken apart (or a service going away) does not wait.
+        std::lock_guard guard(gate.lock);
+        if (!gate.control) return;
+    }
+    const auto now = std::chrono::steady_clock::now();
+    if (_nextRawDataTurn > now) std::this_thread::sleep_for(_nextRawDataTurn - now);
+    _nextRawDataTurn = std::max(now, _nextRawDataTurn) + kRawDataInterval;
 }
 
 void BusService::sendAnswer(sd_bus_message* call, const std::string& client, const Answer& answer)

@@ -10,6 +10,7 @@
 #include <systemd/sd-bus.h>
 
 #include <atomic>
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <map>
@@ -51,9 +52,11 @@ namespace VeltoHost {
 // BusConnection), which also sends the signals, so nothing that thread does
 // may take long: every call into a device's control runs on a worker thread
 // of lower priority, in the order the requests came, and its answer is sent
-// from the connection's thread when it is ready. However many clients read
-// recordings, gestures keep going out on time; each client has a bounded
-// number of requests in progress, so none can queue the others out.
+// from the connection's thread when it is ready. Requests for the raw touch
+// data have a worker of their own that starts one at most every
+// kRawDataInterval, so however many clients read recordings, gestures keep
+// going out on time; each client has a bounded number of requests in
+// progress, so none can queue the others out.
 // addDevice and removeDevice may be called from any thread and wait for the
 // connection's thread. publishEvent may be called from any thread (typically
 // the host's event queue): it only queues the signal and wakes the
@@ -89,6 +92,11 @@ public:
     static constexpr std::size_t kMaxRequestsPerClient = 4;
     // Requests of all clients waiting for or in the worker.
     static constexpr std::size_t kMaxRequests = 64;
+    // Requests for the raw touch data start at most this often, for all
+    // clients together: each one is half a megabyte to copy, write as JSON
+    // and send through the same connection, and the same bus daemon, as the
+    // gestures, so their pace is what keeps the gestures on time.
+    static constexpr std::chrono::milliseconds kRawDataInterval{100};
 
     // Signals waiting for the connection's thread beyond this are dropped
     // (and counted): a bus that stalls must not grow the daemon without bound.
@@ -157,10 +165,13 @@ private:
         std::optional<std::string> value;  // GetProperty's text
     };
     using Work = std::function<Answer(DeviceControl&)>;
+    enum class Lane { Device, RawData };
 
     // Queues `work` for the device `call` was made to; the reply follows
     // when it has run. Returns what sd-bus expects of a handler.
-    int queueRequest(sd_bus_message* call, void* device, sd_bus_error* error, Work work);
+    int queueRequest(sd_bus_message* call, void* device, sd_bus_error* error, Lane lane, Work work);
+    // Raw-data worker only: sleeps until the next request may start.
+    void waitForRawDataTurn(ControlGate& gate);
     void sendAnswer(sd_bus_message* call, const std::string& client, const Answer& answer);
     // The calling client's user id, asked of the bus once per client.
     std::optional<uid_t> callerUid(sd_bus_message* call);
@@ -179,6 +190,8 @@ private:
     // Device calls, off the connection's thread. Declared after the
     // connection so that it goes first: its last answers still reach the bus.
     SerialQueue::Ref _worker;
+    SerialQueue::Ref _rawDataWorker;
+    std::chrono::steady_clock::time_point _nextRawDataTurn{};  // raw-data worker only
     std::atomic<std::size_t> _pendingSignals{0};
     std::atomic<std::uint64_t> _signalsDropped{0};
     std::atomic<bool> _dropNoticed{false};
