@@ -1,5 +1,6 @@
 #include "host/HostDeviceControl.h"
 
+#include "platform/FileKind.h"
 #include "recording/JsonValue.h"
 #include "service/ServicePropertyKey.h"
 
@@ -89,16 +90,6 @@ bool fitsIntegerSetting(const PropertyValue& current, const PropertyValue& value
     }
 }
 
-std::string describeFileType(mode_t mode)
-{
-    if (S_ISDIR(mode)) return "a directory";
-    if (S_ISCHR(mode)) return "a character device";
-    if (S_ISBLK(mode)) return "a block device";
-    if (S_ISFIFO(mode)) return "a pipe";
-    if (S_ISSOCK(mode)) return "a socket";
-    return "not a regular file";
-}
-
 // Why `file` cannot take a recording, or nothing. Only regular files: a
 // device node or a pipe could block the writer or go somewhere the caller
 // did not mean.
@@ -106,7 +97,7 @@ std::optional<std::string> unsuitable(int file)
 {
     struct stat status {};
     if (::fstat(file, &status) != 0) return std::string("the file cannot be examined: ") + std::strerror(errno);
-    if (!S_ISREG(status.st_mode)) return "the file is " + describeFileType(status.st_mode) + ", not a regular file";
+    if (!S_ISREG(status.st_mode)) return "the file is " + fileKind(status.st_mode) + ", not a regular file";
     const int flags = ::fcntl(file, F_GETFL);
     if (flags < 0 || (flags & O_ACCMODE) == O_RDONLY) return std::string("the file is not open for writing");
     if (flags & O_APPEND) return std::string("the file is open for appending; open it for writing from the start");

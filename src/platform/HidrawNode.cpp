@@ -1,5 +1,7 @@
 #include "platform/HidrawNode.h"
 
+#include "platform/FileKind.h"
+
 #include <libudev.h>
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
@@ -18,17 +20,6 @@ struct UdevDeleter {
     void operator()(udev* context) const { udev_unref(context); }
     void operator()(udev_device* device) const { udev_device_unref(device); }
 };
-
-std::string fileKind(mode_t mode)
-{
-    if (S_ISREG(mode)) return "a regular file";
-    if (S_ISDIR(mode)) return "a directory";
-    if (S_ISBLK(mode)) return "a block device";
-    if (S_ISFIFO(mode)) return "a pipe";
-    if (S_ISSOCK(mode)) return "a socket";
-    if (S_ISLNK(mode)) return "a symbolic link";
-    return "not a device node";
-}
 
 }  // namespace
 
