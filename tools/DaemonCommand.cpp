@@ -1,5 +1,6 @@
 #include "DaemonCommand.h"
 
+#include "ToolError.h"
 #include "host/Daemon.h"
 #include "host/JournalLogSink.h"
 #include "host/PluginLocator.h"
@@ -7,6 +8,8 @@
 #include "host/UdevDeviceWatcher.h"
 #include "platform/Log.h"
 #include "platform/RunLoop.h"
+
+#include <malloc.h>
 
 #include <memory>
 #include <string_view>
@@ -18,25 +21,35 @@ using namespace VeltoHost;
 namespace {
 
 constexpr std::string_view kSimulatedPrefix = "sim:";
+constexpr int kLargeBlockBytes = 1 << 20;
 
-// The file's level wins over the environment's. "default" is not the
-// default here: at that level the plug-in notes every frame it receives.
-void setLogging(const DaemonConfig& config)
+// Why a daemon ended with nothing to serve, in the terms of its command line.
+std::string nothingToServe(const DaemonCommand::Options& options)
 {
-    if (config.logThreshold) Log::setThreshold(*config.logThreshold);
-    if (JournalLogSink::stderrIsJournal()) Log::setSink(std::make_shared<JournalLogSink>());
+    std::string why = "no device to serve: ";
+    why += options.devices.empty() ? "none was given with --device"
+                                   : "none of the devices given with --device could be attached";
+    why += options.udev ? ", and the configuration has no [[match]] to take any other"
+                        : ", and with --no-udev no other is taken";
+    return why;
 }
 
 }  // namespace
 
 int DaemonCommand::run(const Options& options)
 {
-    const StopSignals stopSignals;
+    const StopSignals signals(StopSignals::Hangup::Reload);
+    // A large request (a client may send megabytes that are then refused) is
+    // given back to the system once freed: with a fixed threshold, the
+    // allocator maps every block this large on its own instead of raising the
+    // threshold and keeping such blocks in its heap for the life of the service.
+    ::mallopt(M_MMAP_THRESHOLD, kLargeBlockBytes);
 
     Daemon::Options daemon;
     daemon.bus = BusConnection::Address::parse(options.bus);
     daemon.speed = options.speed;
     daemon.keys = options.keys;
+    daemon.configPath = options.config;
     if (!options.config.empty()) daemon.config = DaemonConfig::load(options.config);
     for (const std::string& device : options.devices) {
         if (device.starts_with(kSimulatedPrefix)) {
@@ -46,12 +59,19 @@ int DaemonCommand::run(const Options& options)
         }
     }
     daemon.pluginPath = PluginLocator::chosenOrFound(options.plugin);
-    setLogging(daemon.config);
+    if (JournalLogSink::stderrIsJournal()) Log::setSink(std::make_shared<JournalLogSink>());
+    const std::string busDescription = daemon.bus.description();
 
     std::unique_ptr<DeviceWatcher> watcher;
     if (options.udev) watcher = std::make_unique<UdevDeviceWatcher>(RunLoop::current(), Daemon::kRunLoopMode);
     Daemon service(std::move(daemon), std::move(watcher));
-    service.run(&StopSignals::requested);
+    // A failure is an exit status other than 0, so that systemd's
+    // Restart=on-failure starts the service again.
+    switch (service.run(&StopSignals::requested, &StopSignals::takeReloadRequest)) {
+    case Daemon::Ending::Stopped: return 0;
+    case Daemon::Ending::BusLost: throw ToolError("the connection to " + busDescription + " was lost");
+    case Daemon::Ending::NothingToServe: throw ToolError(nothingToServe(options));
+    }
     return 0;
 }
 

@@ -7,8 +7,8 @@ namespace VeltoTool {
 
 // `veltotouch daemon`: the system service. Serves every configured device
 // (found by udev) and every device given by hand on the bus, turns gestures
-// into key presses, and runs until SIGINT or SIGTERM, then takes the devices
-// apart in the order they came.
+// into key presses, reads its configuration again on SIGHUP, and runs until
+// SIGINT or SIGTERM, then takes the devices apart in the order they came.
 class DaemonCommand {
 public:
     struct Options {
@@ -21,8 +21,9 @@ public:
         std::string plugin;  // empty: look for it (PluginLocator)
     };
 
-    // Returns the exit status; throws ToolError (or the readers' errors) for
-    // what keeps the service from starting.
+    // Returns the exit status (0 when stopped by a signal); throws ToolError
+    // (or the readers' errors) for what keeps the service from starting or
+    // running: no bus, the bus lost, nothing to serve.
     static int run(const Options& options);
 };
 

@@ -2,13 +2,18 @@
 
 #include "host/SimulatedDevicePlayer.h"
 #include "platform/HidrawHostDevice.h"
+#include "platform/HidrawNode.h"
 #include "platform/RunLoop.h"
 #include "platform/SimulatedHostDevice.h"
 
 #include <systemd/sd-daemon.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <chrono>
+#include <cinttypes>
+#include <cstring>
+#include <ctime>
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
@@ -20,118 +25,278 @@ namespace VeltoHost {
 namespace {
 
 constexpr const char* kSimulatedPrefix = "sim:";
-// How often run() looks at the stop request between events.
-constexpr auto kStopPollInterval = std::chrono::milliseconds(100);
+// How often run() looks at the stop and reload requests and the bus between events.
+constexpr auto kPollInterval = std::chrono::milliseconds(100);
 
 std::string fileText(const std::string& path)
 {
+    errno = 0;
     std::ifstream file(path, std::ios::binary);
-    if (!file) throw std::runtime_error(path + ": cannot be read");
+    if (!file) {
+        throw std::runtime_error(std::string("cannot be read: ") + (errno ? std::strerror(errno) : "unknown error"));
+    }
     std::ostringstream text;
     text << file.rdbuf();
     return text.str();
 }
 
+// Sets the configuration's level before anything logs; returns the one it replaced.
+int setFirstLogLevel(const std::optional<int>& threshold)
+{
+    const int before = Log::threshold();
+    if (threshold) Log::setThreshold(*threshold);
+    return before;
+}
+
+// The moment of a reload on systemd's clock, which it asks for with
+// RELOADING=1 so that it can tell this reload from an earlier one.
+std::uint64_t monotonicMicroseconds()
+{
+    timespec now{};
+    ::clock_gettime(CLOCK_MONOTONIC, &now);
+    return static_cast<std::uint64_t>(now.tv_sec) * 1'000'000u + static_cast<std::uint64_t>(now.tv_nsec) / 1000u;
+}
+
 }  // namespace
 
-Daemon::Daemon(Options options, std::unique_ptr<DeviceWatcher> watcher, DeviceOpener open)
-    : _options(std::move(options)), _watcher(std::move(watcher)), _open(std::move(open)), _bus(_options.bus)
+Daemon::Daemon(Options options, std::unique_ptr<DeviceWatcher> watcher, DeviceOpener open,
+               KeyboardMaker makeKeyboard)
+    : _options(std::move(options)),
+      _environmentThreshold(setFirstLogLevel(_options.config.logThreshold)),
+      _watcher(std::move(watcher)),
+      _open(std::move(open)),
+      _makeKeyboard(std::move(makeKeyboard)),
+      _bus(_options.bus)
 {
+    logWarnings(_options.config);
     if (!_open) {
         _open = [](const DeviceWatcher::Device& device) { return std::make_shared<HidrawHostDevice>(device.path); };
     }
+    if (!_makeKeyboard) {
+        _makeKeyboard = [path = _options.uinputPath](const std::set<unsigned int>& keyCodes) {
+            UinputKeyboard::Created created = UinputKeyboard::create(keyCodes, path);
+            return MadeKeyboard{std::move(created.keyboard), std::move(created.error)};
+        };
+    }
     if (_options.keys) {
-        KeyMap keyMap(_options.config.keys);
-        UinputKeyboard::Created created = UinputKeyboard::create(keyMap.keyCodes(), _options.uinputPath);
-        if (created.keyboard) {
-            _keyboard = std::move(created.keyboard);
-        } else {
-            _log.error("no key output: %s", created.error);
-        }
+        _keyboardCodes = KeyMap(_options.config.keys).keyCodes();
+        MadeKeyboard made = _makeKeyboard(_keyboardCodes);
+        _keyboard = std::move(made.keyboard);
+        if (!_keyboard) _log.error("no key output: %s", made.error);
     }
-    for (const std::string& file : _options.simulatedFiles) {
-        VeltoTouch::PipelineRecording recording{std::string_view(fileText(file))};
-        SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
-        const std::string name = kSimulatedPrefix + file;
-        if (DeviceSession* session = attach(name, device)) {
-            session->playInBackground(std::move(recording), device, _options.speed);
-        }
-    }
-    for (const std::string& path : _options.devicePaths) {
-        DeviceWatcher::Device given;
-        given.path = path;
-        openAndAttach(given);
-    }
+    for (const std::string& file : _options.simulatedFiles) attachSimulated(file);
+    for (const std::string& path : _options.devicePaths) attachGivenPath(path);
 }
 
 Daemon::~Daemon()
 {
     if (_watcher) _watcher->stop();
     // In order of attachment, each device taken apart whole before the next.
-    for (auto& session : _sessions) session.second.reset();
+    for (Attached& attached : _sessions) attached.session.reset();
 }
 
-void Daemon::run(const std::function<bool()>& stopRequested)
+Daemon::Ending Daemon::run(const std::function<bool()>& stopRequested, const std::function<bool()>& reloadRequested)
 {
+    // Said before the watcher starts: whether a device could ever come is a
+    // matter of the configuration, not of what happens to be plugged in.
+    if (nothingToServe()) return Ending::NothingToServe;
     if (_watcher) {
         _watcher->start([this](const DeviceWatcher::Device& device) { attachWatched(device); },
-                        [this](const std::string& path) { detach(path); });
+                        [this](const std::string& path) { removeWatched(path); });
     }
     sd_notify(0, "READY=1");
     _log.log("serving %ju devices", static_cast<std::uint64_t>(_sessions.size()));
-    while (!stopRequested()) {
+    Ending ending = Ending::Stopped;
+    for (;;) {
+        // A reload asked for before a stop still happens: its sender is told
+        // it was done (READY=1) rather than left waiting.
+        if (reloadRequested && reloadRequested()) reload();
+        if (_bus.connectionLost()) {
+            ending = Ending::BusLost;
+            break;
+        }
+        if (nothingToServe()) {
+            ending = Ending::NothingToServe;
+            break;
+        }
+        if (stopRequested()) break;
         // Without a watcher the mode may have nothing to wait on, and the
         // loop returns at once: then wait here instead of spinning.
-        if (RunLoop::run(kRunLoopMode, kStopPollInterval, false) == RunLoop::RunResult::Finished) {
-            std::this_thread::sleep_for(kStopPollInterval);
+        if (RunLoop::run(kRunLoopMode, kPollInterval, false) == RunLoop::RunResult::Finished) {
+            std::this_thread::sleep_for(kPollInterval);
         }
     }
     sd_notify(0, "STOPPING=1");
+    _log.log("stopping: taking %ju devices apart", static_cast<std::uint64_t>(_sessions.size()));
     if (_watcher) _watcher->stop();
+    return ending;
+}
+
+bool Daemon::nothingToServe() const
+{
+    return _sessions.empty() && (!_watcher || _options.config.matches.empty());
+}
+
+void Daemon::reload()
+{
+    sd_notifyf(0, "RELOADING=1\nMONOTONIC_USEC=%" PRIu64, monotonicMicroseconds());
+    if (_options.configPath.empty()) {
+        _log.log("reload: no configuration file was given (--config); nothing to read again");
+    } else {
+        try {
+            apply(DaemonConfig::load(_options.configPath));
+            _log.log("configuration reloaded from %s", _options.configPath);
+        } catch (const std::exception& error) {
+            _log.error("configuration not reloaded, the previous one stays in force: %s", error.what());
+        }
+    }
+    sd_notify(0, "READY=1");
+}
+
+void Daemon::apply(DaemonConfig config)
+{
+    logWarnings(config);
+    applyLogLevel(config.logThreshold);
+    const bool keysChanged = !(config.keys == _options.config.keys);
+    _options.config = std::move(config);
+    if (keysChanged) applyKeys(_options.config.keys);
+    applyMatches();
+}
+
+void Daemon::logWarnings(const DaemonConfig& config) const
+{
+    for (const std::string& warning : config.warnings) _log.error("%s", warning);
+}
+
+void Daemon::applyLogLevel(const std::optional<int>& threshold) const
+{
+    Log::setThreshold(threshold.value_or(_environmentThreshold));
+}
+
+void Daemon::applyKeys(const KeyMap::Bindings& keys)
+{
+    const std::set<unsigned int> codes = KeyMap(keys).keyCodes();
+    std::unique_ptr<KeyboardSink> retired;
+    // A keyboard offers only the keys it was made with; one that lacks a new
+    // key is made anew. One that merely offers a key no longer bound stays:
+    // a key nobody sends costs nothing, a new input device disturbs desktops.
+    if (_keyboard && !std::includes(_keyboardCodes.begin(), _keyboardCodes.end(), codes.begin(), codes.end())) {
+        MadeKeyboard made = _makeKeyboard(codes);
+        if (made.keyboard) {
+            retired = std::exchange(_keyboard, std::move(made.keyboard));
+            _keyboardCodes = codes;
+        } else {
+            _log.error("the new keys need a new virtual keyboard, and it could not be made (%s); the old one stays, "
+                       "without the keys it lacks",
+                       made.error);
+        }
+    }
+    for (Attached& attached : _sessions) attached.session->changeKeys(keys, _keyboard.get());
+    // Every session has moved to the new keyboard on its own queue; the old
+    // one goes under the lock, like every other use of a keyboard.
+    std::lock_guard guard(_keyboardLock);
+    retired.reset();
+}
+
+void Daemon::applyMatches()
+{
+    std::vector<std::string> released;
+    for (const Attached& attached : _sessions) {
+        const auto present = _present.find(attached.name);
+        if (attached.watched && present != _present.end() &&
+            !_options.config.takes(present->second.vendor, present->second.product)) {
+            released.push_back(attached.name);
+        }
+    }
+    for (const std::string& name : released) detach(name);
+    for (const auto& [path, device] : _present) {
+        if (_options.config.takes(device.vendor, device.product) && !isAttached(path)) openAndAttach(device, true);
+    }
+}
+
+void Daemon::attachSimulated(const std::string& file)
+{
+    const std::string name = kSimulatedPrefix + file;
+    std::optional<VeltoTouch::PipelineRecording> recording;
+    try {
+        recording.emplace(std::string_view(fileText(file)));
+    } catch (const std::exception& error) {
+        _log.error("%s: not attached: %s", name, error.what());
+        return;
+    }
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+    if (DeviceSession* session = attach(name, device, false)) {
+        session->playInBackground(std::move(*recording), device, _options.speed);
+    }
+}
+
+void Daemon::attachGivenPath(const std::string& path)
+{
+    // Anything else would open without complaint and deliver nothing, or
+    // garbage, for as long as the service runs.
+    const std::string whatElse = HidrawNode::whatElse(path);
+    if (!whatElse.empty()) {
+        _log.error("%s %s; expected a hidraw device node (/dev/hidrawN) or sim:FILE", path, whatElse);
+        return;
+    }
+    DeviceWatcher::Device given;
+    given.path = path;
+    openAndAttach(given, false);
 }
 
 void Daemon::attachWatched(const DeviceWatcher::Device& device)
 {
+    _present[device.path] = device;
     if (!_options.config.takes(device.vendor, device.product)) return;
-    const bool known = std::any_of(_sessions.begin(), _sessions.end(),
-                                   [&](const auto& session) { return session.first == device.path; });
-    if (known) return;  // reported by both the enumeration and the monitor
-    openAndAttach(device);
+    if (isAttached(device.path)) return;  // reported by both the enumeration and the monitor
+    openAndAttach(device, true);
 }
 
-void Daemon::openAndAttach(const DeviceWatcher::Device& device)
+void Daemon::openAndAttach(const DeviceWatcher::Device& device, bool watched)
 {
     HostDevice::Ref opened;
     try {
         opened = _open(device);
     } catch (const std::exception& error) {
-        _log.error("%s: %s", device.path, error.what());
+        _log.error("%s: not attached: %s", device.path, error.what());
         return;
     }
-    attach(device.path, std::move(opened));
+    attach(device.path, std::move(opened), watched);
 }
 
-DeviceSession* Daemon::attach(const std::string& name, HostDevice::Ref device)
+DeviceSession* Daemon::attach(const std::string& name, HostDevice::Ref device, bool watched)
 {
     DeviceSession::Outputs outputs{&_bus, _keyboard.get(), &_keyboardLock, _options.config.keys};
     try {
-        _sessions.emplace_back(name, std::make_unique<DeviceSession>(name, std::move(device), _options.pluginPath,
-                                                                     std::move(outputs)));
+        auto session =
+            std::make_unique<DeviceSession>(name, std::move(device), _options.pluginPath, std::move(outputs));
+        _sessions.push_back({name, watched, std::move(session)});
     } catch (const std::exception& error) {
         // One device that will not start does not stop the others.
         _log.error("%s: not attached: %s", name, error.what());
         return nullptr;
     }
     _log.log("%s attached", name);
-    return _sessions.back().second.get();
+    return _sessions.back().session.get();
+}
+
+void Daemon::removeWatched(const std::string& path)
+{
+    _present.erase(path);
+    detach(path);
 }
 
 void Daemon::detach(const std::string& name)
 {
-    auto it = std::find_if(_sessions.begin(), _sessions.end(), [&](const auto& s) { return s.first == name; });
+    auto it = std::find_if(_sessions.begin(), _sessions.end(), [&](const Attached& each) { return each.name == name; });
     if (it == _sessions.end()) return;
     _sessions.erase(it);
     _log.log("%s detached", name);
+}
+
+bool Daemon::isAttached(const std::string& name) const
+{
+    return std::any_of(_sessions.begin(), _sessions.end(), [&](const Attached& each) { return each.name == name; });
 }
 
 }  // namespace VeltoHost

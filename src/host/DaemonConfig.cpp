@@ -7,8 +7,10 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
+#include <cstdio>
 #include <cstring>
 #include <sstream>
 #include <utility>
@@ -28,6 +30,13 @@ constexpr std::array<std::pair<std::string_view, int>, 4> kLogLevels{{
     {"error", static_cast<int>(LogLevel::Error)},
     {"off", Log::kOff},
 }};
+
+std::string hexId(std::uint16_t id)
+{
+    char text[sizeof "0xFFFF"];
+    std::snprintf(text, sizeof text, "0x%04X", static_cast<unsigned int>(id));
+    return text;
+}
 
 std::string quoted(std::string_view text) { return "\"" + std::string(text) + "\""; }
 
@@ -49,21 +58,26 @@ public:
 
     [[noreturn]] void fail(const toml::source_region& where, const std::string& what) const
     {
-        throw DaemonConfig::Error(_sourceName + ":" + std::to_string(where.begin.line) + ":" +
-                                  std::to_string(where.begin.column) + ": " + what);
+        throw DaemonConfig::Error(place(where) + ": " + what);
     }
 
     void readDocument(const toml::table& document, DaemonConfig& config) const
     {
         for (const auto& [key, node] : document) {
             if (key.str() == "log_level") config.logThreshold = readLogLevel(node);
-            else if (key.str() == "match") readMatches(key, node, config.matches);
+            else if (key.str() == "match") readMatches(key, node, config);
             else if (key.str() == "keys") readKeys(key, node, config.keys);
             else fail(key.source(), "unknown setting " + quoted(key.str()) + " (expected log_level, [[match]] or [keys])");
         }
     }
 
 private:
+    // "FILE:LINE:COLUMN", the start of every message about the file.
+    std::string place(const toml::source_region& where) const
+    {
+        return _sourceName + ":" + std::to_string(where.begin.line) + ":" + std::to_string(where.begin.column);
+    }
+
     int readLogLevel(const toml::node& node) const
     {
         const auto* name = node.as_string();
@@ -75,13 +89,30 @@ private:
         fail(node.source(), "log_level must be \"debug\", \"default\", \"error\" or \"off\"");
     }
 
-    void readMatches(const toml::key& key, const toml::node& node, std::vector<DaemonConfig::DeviceMatch>& matches) const
+    void readMatches(const toml::key& key, const toml::node& node, DaemonConfig& config) const
     {
         const auto* tables = node.as_array();
         if (!tables || !tables->is_array_of_tables()) {
             fail(key.source(), "match must be a list of tables: write each one as [[match]]");
         }
-        for (const toml::node& each : *tables) matches.push_back(readMatch(*each.as_table()));
+        // Where each match was first written, so that a repeat can point back at it.
+        std::vector<std::uint32_t> firstLines;
+        for (const toml::node& each : *tables) {
+            const toml::table& table = *each.as_table();
+            const DaemonConfig::DeviceMatch match = readMatch(table);
+            const auto earlier = std::find(config.matches.begin(), config.matches.end(), match);
+            if (earlier == config.matches.end()) {
+                config.matches.push_back(match);
+                firstLines.push_back(table.source().begin.line);
+                continue;
+            }
+            // Harmless to the daemon, but likely a slip (a copied table whose ids
+            // were meant to change): said, and taken once.
+            const auto firstLine = firstLines[static_cast<std::size_t>(earlier - config.matches.begin())];
+            config.warnings.push_back(place(table.source()) + ": [[match]] vendor " + hexId(match.vendor) +
+                                      " product " + hexId(match.product) + " repeats the one at line " +
+                                      std::to_string(firstLine) + "; taken once");
+        }
     }
 
     DaemonConfig::DeviceMatch readMatch(const toml::table& table) const

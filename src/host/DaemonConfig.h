@@ -33,6 +33,8 @@ namespace VeltoHost {
 //
 // A file is all or nothing: the first problem raises Error with a message
 // "FILE:LINE:COLUMN: what is wrong" that points at the offending key or value.
+// What is harmless but likely a slip (a [[match]] that repeats an earlier one)
+// is taken once and left as a warning in the same form, for the caller to log.
 class DaemonConfig {
 public:
     struct DeviceMatch {
@@ -62,6 +64,8 @@ public:
     // A Log threshold (a LogLevel's value, or Log::kOff); empty when the file
     // does not say, so that VELTOTOUCH_LOG_LEVEL still decides.
     std::optional<int> logThreshold;
+    // "FILE:LINE:COLUMN: what looks wrong", in the order of the file.
+    std::vector<std::string> warnings;
 };
 
 }  // namespace VeltoHost

@@ -21,7 +21,7 @@ constexpr std::size_t kMaxQueuedReports = 512;
 
 DeviceSession::DeviceSession(std::string name, HostDevice::Ref device, const std::string& pluginPath,
                              Outputs outputs)
-    : _name(std::move(name)), _outputs(std::move(outputs)), _keyMap(_outputs.keys)
+    : _name(std::move(name)), _outputs(std::move(outputs)), _keyMap(_outputs.keys), _keyboard(_outputs.keyboard)
 {
     // Subscribed before the start, so that a real device's first reports are
     // keyed too; they reach the bus once its object exists (a controller
@@ -51,6 +51,19 @@ void DeviceSession::takeApart() noexcept
     sendKeys(_keyMap.releaseAll());
     if (const auto id = busId()) _outputs.bus->removeDevice(*id);
     _host.stop();
+}
+
+void DeviceSession::changeKeys(const KeyMap::Bindings& keys, KeyboardSink* keyboard)
+{
+    auto swap = [this, &keys, keyboard] {
+        sendKeys(_keyMap.releaseAll());
+        _keyMap = KeyMap(keys);
+        _keyboard = keyboard;
+    };
+    const SerialQueue::Ref& queue = _host.queue();
+    if (!queue) return swap();  // not running: no event can arrive
+    queue->async(swap);
+    queue->drain();
 }
 
 void DeviceSession::playInBackground(VeltoTouch::PipelineRecording recording, SimulatedHostDevice::Ref device,
@@ -96,10 +109,10 @@ void DeviceSession::onEvent(const HidEventRef& event)
 
 void DeviceSession::sendKeys(const KeyMap::Actions& actions)
 {
-    if (actions.empty() || !_outputs.keyboard) return;
+    if (actions.empty() || !_keyboard) return;
     std::unique_lock<std::mutex> guard;
     if (_outputs.keyboardLock) guard = std::unique_lock(*_outputs.keyboardLock);
-    _outputs.keyboard->play(actions);
+    _keyboard->play(actions);
 }
 
 }  // namespace VeltoHost

@@ -24,9 +24,11 @@ namespace VeltoHost {
 // into key presses.
 //
 // Events reach the bus and the key map on the host's event queue, so the key
-// map belongs to that queue's thread. A keyboard shared by several devices is
-// written under the lock the service hands in, one gesture's actions at a
-// time, so that two devices never interleave a press and its release.
+// map, and the keyboard it writes to, belong to that queue's thread; a new
+// map is swapped in there, between two events. A keyboard shared by several
+// devices is written under the lock the service hands in, one gesture's
+// actions at a time, so that two devices never interleave a press and its
+// release.
 //
 // Taken apart in the order that leaves nothing behind: the simulated
 // device's playback stops; the plug-in is unscheduled (its last events are
@@ -36,7 +38,7 @@ class DeviceSession {
 public:
     struct Outputs {
         BusService* bus = nullptr;           // null: no bus object
-        KeyboardSink* keyboard = nullptr;    // null: no key output
+        KeyboardSink* keyboard = nullptr;    // null: no key output (until changeKeys gives one)
         std::mutex* keyboardLock = nullptr;  // shared by every session writing to `keyboard`
         KeyMap::Bindings keys = KeyMap::defaultBindings();
     };
@@ -61,6 +63,13 @@ public:
     std::uint64_t play(const VeltoTouch::PipelineRecording& recording, const SimulatedHostDevice::Ref& device,
                        double speed);
 
+    // Replaces the key map, and the keyboard its keys go to, between two of
+    // the device's events; returns once done. A key the old map holds down is
+    // released first, on the old keyboard (the one it was pressed on), so
+    // that a hold in progress cannot leave it down. The old keyboard may go
+    // once this returns.
+    void changeKeys(const KeyMap::Bindings& keys, KeyboardSink* keyboard);
+
     const std::string& name() const noexcept { return _name; }
     std::optional<BusService::DeviceId> busId() const noexcept
     {
@@ -83,7 +92,9 @@ private:
     // Set once by the constructor while the host's queue may already deliver.
     std::atomic<BusService::DeviceId> _busId{kNoBusId};
     HostEventSystem::SubscriptionId _subscription = 0;
-    KeyMap _keyMap;  // the host's event queue only, and the destructor once that is drained
+    // The host's event queue only, and the destructor once that is drained.
+    KeyMap _keyMap;
+    KeyboardSink* _keyboard;
 
     std::thread _player;
     std::atomic<bool> _stopPlaying{false};

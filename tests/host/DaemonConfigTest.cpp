@@ -134,6 +134,22 @@ TEST_F(DaemonConfigTest, BadFilesNameTheFileThePlaceAndTheFault)
     }
 }
 
+TEST_F(DaemonConfigTest, ARepeatedMatchIsTakenOnceWithAWarningThatPointsAtIt)
+{
+    const std::string path = write("twice.toml",
+                                   "[[match]]\nvendor = 0x1234\nproduct = 0x5678\n"
+                                   "[[match]]\nvendor = 0x1234\nproduct = 0x0009\n"
+                                   "[[match]]\nproduct = 22136\nvendor = 4660\n"
+                                   "[[match]]\nvendor = 0x1234\nproduct = 9\n");
+    const DaemonConfig config = DaemonConfig::load(path);
+    EXPECT_EQ(config.matches, (std::vector<DaemonConfig::DeviceMatch>{{0x1234, 0x5678}, {0x1234, 0x0009}}));
+    EXPECT_EQ(config.warnings,
+              (std::vector<std::string>{
+                  path + ":7:1: [[match]] vendor 0x1234 product 0x5678 repeats the one at line 1; taken once",
+                  path + ":10:1: [[match]] vendor 0x1234 product 0x0009 repeats the one at line 4; taken once"}));
+    EXPECT_TRUE(DaemonConfig::load(write("once.toml", "[[match]]\nvendor = 1\nproduct = 2\n")).warnings.empty());
+}
+
 TEST_F(DaemonConfigTest, AFileThatCannotBeReadIsNamedNotTakenForAnEmptyOne)
 {
     const std::string absent = (_dir / "absent.toml").string();

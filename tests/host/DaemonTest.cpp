@@ -8,7 +8,15 @@
 
 #include <gtest/gtest.h>
 
+#include <linux/input-event-codes.h>
+#include <unistd.h>
+
 #include <atomic>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <mutex>
+#include <set>
 #include <string>
 #include <thread>
 #include <vector>
@@ -52,7 +60,121 @@ private:
     std::atomic<bool> _started{false};
 };
 
+// Takes every key and keeps none: the reload test looks at which keyboards
+// were made, the session test at what they are sent.
+class IdleKeyboard final : public KeyboardSink {
+public:
+    bool emitKey(unsigned int, bool) override { return true; }
+    bool sync() override { return true; }
+};
+
+// The limit only keeps a broken daemon from hanging the test.
+bool eventually(const std::function<bool()>& done)
+{
+    const auto limit = std::chrono::steady_clock::now() + 20s;
+    while (!done()) {
+        if (std::chrono::steady_clock::now() > limit) return false;
+        std::this_thread::sleep_for(1ms);
+    }
+    return true;
+}
+
+std::vector<std::string> deviceNames(ControlClient& client)
+{
+    std::vector<std::string> names;
+    for (const std::string& path : client.listDevices()) names.push_back(client.name(path).value);
+    return names;
+}
+
 }  // namespace
+
+TEST(DaemonTest, AReloadTakesNewKeysLogLevelAndMatchesAndABadFileChangesNothing)
+{
+    PrivateBus bus;
+    ASSERT_FALSE(bus.address().empty()) << bus.error();
+    const std::string path =
+        (std::filesystem::temp_directory_path() / ("daemon-reload-" + std::to_string(::getpid()) + ".toml")).string();
+    const auto write = [&](const std::string& text) { std::ofstream(path) << text; };
+    write("[[match]]\nvendor = 0x1234\nproduct = 0x5678\n");
+    Daemon::Options options;
+    options.bus = BusConnection::Address::at(bus.address());
+    options.simulatedFiles = {kExamples + "/taps.json"};
+    options.speed = 0;
+    options.config = DaemonConfig::load(path);
+    options.configPath = path;
+    options.pluginPath = VELTO_SERVICE_MODULE_PATH;
+    auto watcher = std::make_unique<TestWatcher>();
+    TestWatcher& plugs = *watcher;
+    std::mutex madeLock;
+    std::vector<std::set<unsigned int>> made;  // the key codes of each keyboard made, guarded by madeLock
+    const auto keyboardsMade = [&] {
+        std::lock_guard guard(madeLock);
+        return made;
+    };
+    const int environmentThreshold = Log::threshold();
+    ControlClient client(BusConnection::Address::at(bus.address()));
+    ASSERT_TRUE(client.connected()) << client.connectError();
+    ASSERT_TRUE(client.watchSignals());
+
+    Daemon daemon(
+        options, std::move(watcher), [](const DeviceWatcher::Device&) { return SimulatedHostDevice::create(); },
+        [&](const std::set<unsigned int>& codes) {
+            std::lock_guard guard(madeLock);
+            made.push_back(codes);
+            return Daemon::MadeKeyboard{std::make_unique<IdleKeyboard>(), {}};
+        });
+    // The daemon takes a request at one poll and has carried it out by the next.
+    std::atomic<int> polls{0};
+    std::atomic<bool> reloadRequested{false};
+    const auto reload = [&] {
+        reloadRequested = true;
+        const int asked = polls.load();
+        return eventually([&] { return polls.load() >= asked + 2; });
+    };
+    std::jthread serving([&](std::stop_token stop) {
+        daemon.run([&] { return stop.stop_requested(); },
+                   [&] {
+                       ++polls;
+                       return reloadRequested.exchange(false);
+                   });
+    });
+    while (!plugs.started()) std::this_thread::sleep_for(1ms);
+    plugs.plug({"/dev/hidraw-a", 3, 0x1234, 0x5678});
+    plugs.plug({"/dev/hidraw-b", 3, 0x1234, 0x9999});
+    ASSERT_TRUE(client.waitUntil([&] { return client.signalsNamed("DeviceAdded").size() == 2; }));
+
+    const std::string takeB = "[[match]]\nvendor = 0x1234\nproduct = 0x9999\n";
+    struct Step {
+        std::string file;
+        std::vector<std::string> devices;
+        std::size_t keyboards;  // made so far
+        int threshold;
+    };
+    const std::vector<Step> steps = {
+        // A key the first keyboard lacks: a new one. The device given by hand stays.
+        {"log_level = \"off\"\n" + takeB + "[keys]\ntap.middle = \"KEY_MUTE\"\n",
+         {"sim:" + kExamples + "/taps.json", "/dev/hidraw-b"}, 2, Log::kOff},
+        // A key fewer: the keyboard stays. No level: the environment's again.
+        {takeB + "[keys]\ntap.middle = \"\"\n", {"sim:" + kExamples + "/taps.json", "/dev/hidraw-b"}, 2,
+         environmentThreshold},
+        {"[[match]\nlog_level = \"off\"\n", {"sim:" + kExamples + "/taps.json", "/dev/hidraw-b"}, 2,
+         environmentThreshold},
+        // The defaults again: play/pause is back, on a new keyboard.
+        {"", {"sim:" + kExamples + "/taps.json"}, 3, environmentThreshold},
+    };
+    for (const Step& step : steps) {
+        SCOPED_TRACE(step.file);
+        write(step.file);
+        ASSERT_TRUE(reload());
+        EXPECT_EQ(deviceNames(client), step.devices);
+        EXPECT_EQ(keyboardsMade().size(), step.keyboards);
+        EXPECT_EQ(Log::threshold(), step.threshold);
+    }
+    const std::vector<std::set<unsigned int>> keyboards = keyboardsMade();
+    EXPECT_EQ(keyboards[1], (std::set<unsigned int>{KEY_VOLUMEUP, KEY_VOLUMEDOWN, KEY_MUTE, KEY_VOICECOMMAND}));
+    serving.request_stop();
+    std::filesystem::remove(path);
+}
 
 TEST(DaemonTest, ServesSimulatedAndHotPluggedDevicesAndTakesOnlyTheConfiguredOnes)
 {

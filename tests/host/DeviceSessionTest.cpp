@@ -7,6 +7,8 @@
 #include <gtest/gtest.h>
 #include <linux/input-event-codes.h>
 
+#include <algorithm>
+#include <condition_variable>
 #include <mutex>
 #include <string>
 #include <vector>
@@ -27,6 +29,7 @@ public:
     {
         std::lock_guard guard(_lock);
         _actions.push_back((pressed ? "+" : "-") + KeyMap::keyName(code));
+        _changed.notify_all();
         return true;
     }
     bool sync() override { return true; }
@@ -35,13 +38,32 @@ public:
         std::lock_guard guard(_lock);
         return _actions;
     }
+    // The deadline only keeps a broken session from hanging the test.
+    bool waitFor(const std::string& action)
+    {
+        std::unique_lock guard(_lock);
+        return _changed.wait_for(guard, 20s, [&] { return std::ranges::find(_actions, action) != _actions.end(); });
+    }
 
 private:
     std::mutex _lock;
+    std::condition_variable _changed;
     std::vector<std::string> _actions;
 };
 
 PipelineRecording recordingOf(const std::string& name) { return PipelineRecording{std::string_view(readFile(kExamples + "/" + name))}; }
+
+// The first `reports` input reports of a recording, with the state frames among them.
+PipelineRecording cutAfter(const PipelineRecording& recording, std::size_t reports)
+{
+    PipelineRecording cut;
+    std::size_t seen = 0;
+    for (const PipelineRecording::Frame& frame : recording.frames()) {
+        if (frame.type == PipelineRecording::Frame::Type::InputReport && ++seen > reports) break;
+        cut.appendFrame(frame);
+    }
+    return cut;
+}
 
 }  // namespace
 
@@ -69,14 +91,7 @@ TEST(DeviceSessionTest, GesturesBecomeKeysAndAHeldKeyIsReleasedWhenTheDeviceGoes
 
     // A hold in the middle cut short by the device going away: the voice
     // command key is not left down.
-    PipelineRecording holds = recordingOf("holds.json");
-    PipelineRecording::FrameList frames = holds.frames();
-    std::size_t reports = 0;
-    std::erase_if(frames, [&](const PipelineRecording::Frame& frame) {
-        return frame.type == PipelineRecording::Frame::Type::InputReport && ++reports > 250;  // hold-start at frame 217
-    });
-    PipelineRecording cut;
-    for (auto& frame : frames) cut.appendFrame(frame);
+    PipelineRecording cut = cutAfter(recordingOf("holds.json"), 250);  // hold-start at frame 217
     {
         SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
         DeviceSession session("sim:holds.json", device, VELTO_SERVICE_MODULE_PATH, outputs);
@@ -88,6 +103,32 @@ TEST(DeviceSessionTest, GesturesBecomeKeysAndAHeldKeyIsReleasedWhenTheDeviceGoes
     ASSERT_GE(actions.size(), 2u);
     EXPECT_EQ(std::vector<std::string>(actions.end() - 2, actions.end()),
               (std::vector<std::string>{"+KEY_VOICECOMMAND", "-KEY_VOICECOMMAND"}));
+}
+
+TEST(DeviceSessionTest, NewKeysTakeOverBetweenEventsAndTheHeldKeyIsReleasedWhereItWasPressed)
+{
+    RecordingKeyboard before;
+    RecordingKeyboard after;
+    std::mutex keyboardLock;
+    KeyMap::Bindings muted = KeyMap::defaultBindings();
+    muted.clicks[{Gesture::Kind::Tap, Gesture::Region::Middle}] = KEY_MUTE;
+    {
+        SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+        DeviceSession session("sim:holds.json", device, VELTO_SERVICE_MODULE_PATH,
+                              {nullptr, &before, &keyboardLock, KeyMap::defaultBindings()});
+        session.playInBackground(cutAfter(recordingOf("holds.json"), 250), device, 0);
+        // Mid-hold: the voice command key is down.
+        ASSERT_TRUE(before.waitFor("+KEY_VOICECOMMAND"));
+        session.changeKeys(muted, &after);
+        EXPECT_EQ(before.actions().back(), "-KEY_VOICECOMMAND");
+        ASSERT_TRUE(session.waitUntilPlayed(20s));
+        session.play(recordingOf("taps.json"), device, 0);
+    }
+    // A tap at the top, then the hold in the middle.
+    EXPECT_EQ(before.actions(), (std::vector<std::string>{"+KEY_VOLUMEUP", "-KEY_VOLUMEUP", "+KEY_VOICECOMMAND",
+                                                          "-KEY_VOICECOMMAND"}));
+    EXPECT_EQ(after.actions(), (std::vector<std::string>{"+KEY_VOLUMEUP", "-KEY_VOLUMEUP", "+KEY_MUTE", "-KEY_MUTE",
+                                                         "+KEY_VOLUMEDOWN", "-KEY_VOLUMEDOWN"}));
 }
 
 TEST(DeviceSessionTest, ADeviceThatCannotStartLeavesNoObjectOnTheBus)

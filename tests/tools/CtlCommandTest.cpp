@@ -138,8 +138,7 @@ TEST(CtlCommandTest, WritesThatCannotHoldAreToldAndLargeValuesCostTheDaemonNothi
         EXPECT_EQ(client.setProperty(path, "Pipeline.Algs.ActivationThreshold", huge).error,
                   BusService::kErrorInvalidArgument);
     }
-    EXPECT_LT(residentKilobytes(daemon->pid()), before + 24 * 1024) << "kB resident before: " << before;
-    std::cerr << "RSS " << before << " -> " << residentKilobytes(daemon->pid()) << "\n";
+    EXPECT_LT(residentKilobytes(daemon->pid()), before + 8 * 1024) << "kB resident before: " << before;
     EXPECT_EQ(stop(*daemon, SIGTERM).status, 0);
 }
 

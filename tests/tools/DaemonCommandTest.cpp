@@ -11,7 +11,11 @@
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
 
+#include <sys/socket.h>
+#include <sys/un.h>
+
 #include <csignal>
+#include <cstring>
 #include <map>
 
 using namespace VeltoTool::Testing;
@@ -67,6 +71,50 @@ std::vector<std::string> daemonArguments(const PrivateBus& bus, const std::vecto
         arguments.push_back("sim:" + file);
     }
     return arguments;
+}
+
+// systemd's end of sd_notify: a datagram socket named to the daemon in
+// NOTIFY_SOCKET, which tells the test when the daemon is ready and when a
+// reload is done.
+class NotifySocket {
+public:
+    explicit NotifySocket(const fs::path& path) : _path(path.string())
+    {
+        _fd = ::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0);
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        std::strncpy(address.sun_path, _path.c_str(), sizeof address.sun_path - 1);
+        ::bind(_fd, reinterpret_cast<const sockaddr*>(&address), sizeof address);
+    }
+    ~NotifySocket() { ::close(_fd); }
+    NotifySocket(const NotifySocket&) = delete;
+    NotifySocket& operator=(const NotifySocket&) = delete;
+
+    ProcessSetup setup() const
+    {
+        ProcessSetup setup;
+        setup.environment = {"NOTIFY_SOCKET=" + _path};
+        return setup;
+    }
+    // The next message; empty when none comes before the deadline.
+    std::string next() const
+    {
+        pollfd readable{_fd, POLLIN, 0};
+        if (::poll(&readable, 1, static_cast<int>(std::chrono::milliseconds(kDeadline).count())) != 1) return {};
+        char message[4096];
+        const ssize_t length = ::recv(_fd, message, sizeof message, 0);
+        return length > 0 ? std::string(message, static_cast<std::size_t>(length)) : std::string();
+    }
+
+private:
+    std::string _path;
+    int _fd = -1;
+};
+
+std::vector<std::string> operator+(std::vector<std::string> first, const std::vector<std::string>& second)
+{
+    first.insert(first.end(), second.begin(), second.end());
+    return first;
 }
 
 }  // namespace
@@ -203,4 +251,104 @@ TEST(DaemonCommandTest, ATermDuringPlaybackTakesEveryDeviceApartInOrder)
     }
     // A demo cut short by the signal: fewer gestures than the whole replay.
     EXPECT_LT(watcher.signalsNamed("Gesture").size(), replay(files[0]).events.size() + replay(files[1]).events.size());
+}
+
+TEST(DaemonCommandTest, ADaemonThatLosesItsBusEndsWithAFailureForItsServiceManager)
+{
+    PrivateBus bus;
+    ASSERT_FALSE(bus.address().empty()) << bus.error();
+    TempDir dir;
+    const NotifySocket systemd(dir.file("notify"));
+    ToolProcess daemon(daemonArguments(bus, {kExamples + "/taps.json"}, "0"), systemd.setup());
+    ASSERT_EQ(systemd.next(), "READY=1");
+
+    bus.kill();
+    const ToolProcess::Result ended = daemon.finish(kDeadline);
+    ASSERT_TRUE(ended.exited) << "ended by signal " << ended.signal << "\n" << ended.err;
+    EXPECT_EQ(ended.status, 1);
+    EXPECT_TRUE(ended.err.ends_with("\nveltotouch: the connection to the bus at " + bus.address() + " was lost\n"))
+        << ended.err;
+}
+
+TEST(DaemonCommandTest, BadDevicesAreNamedAndLeftOutAndWithNothingToServeTheDaemonEnds)
+{
+    PrivateBus bus;
+    ASSERT_FALSE(bus.address().empty()) << bus.error();
+    TempDir dir;
+    const std::string bad = dir.file("bad.json", "not a recording").string();
+    const std::vector<std::string> badDevices{"--device", "/dev/null", "--device", "sim:" + bad};
+    const std::string refusals[] = {
+        "/dev/null is a character device of the \"mem\" subsystem (1:3); expected a hidraw device node (/dev/hidrawN) "
+        "or sim:FILE\n",
+        "sim:" + bad + ": not attached: migrateSerializedContainer failed: invalid container\n",
+    };
+
+    const NotifySocket systemd(dir.file("notify"));
+    ToolProcess daemon(daemonArguments(bus, {kExamples + "/taps.json"}, "0") + badDevices, systemd.setup());
+    ASSERT_EQ(systemd.next(), "READY=1");
+    EXPECT_EQ(ctl(bus, {"devices"}).out, "0  sim:" + kExamples + "/taps.json\n");
+    daemon.signal(SIGTERM);
+    const ToolProcess::Result served = daemon.finish(kDeadline);
+    EXPECT_EQ(served.status, 0) << served.err;
+    for (const std::string& refusal : refusals) EXPECT_NE(served.err.find(refusal), std::string::npos) << served.err;
+
+    // Nothing attached, and nothing that udev could ever bring.
+    const std::string none = "veltotouch: no device to serve: none ";
+    const std::vector<std::string> withUdev{"daemon", "--bus", bus.address()};
+    const std::vector<std::string> noUdev = withUdev + std::vector<std::string>{"--no-udev"};
+    const struct {
+        std::vector<std::string> arguments;
+        std::string lastLine;
+    } ends[] = {
+        {noUdev + badDevices,
+         none + "of the devices given with --device could be attached, and with --no-udev no other is taken\n"},
+        {withUdev + badDevices,
+         none + "of the devices given with --device could be attached, and the configuration has no [[match]] to "
+                "take any other\n"},
+        {noUdev,
+         none + "was given with --device, and with --no-udev no other is taken\n"},
+    };
+    for (const auto& end : ends) {
+        ToolProcess ending(end.arguments);
+        const ToolProcess::Result ended = ending.finish(kDeadline);
+        EXPECT_EQ(ended.status, 1) << ended.err;
+        EXPECT_TRUE(ended.err.ends_with(end.lastLine)) << ended.err;
+    }
+}
+
+TEST(DaemonCommandTest, SighupReloadsTheConfigurationAndABadFileLeavesThePreviousOneInForce)
+{
+    PrivateBus bus;
+    ASSERT_FALSE(bus.address().empty()) << bus.error();
+    TempDir dir;
+    const std::string config = dir.file("veltotouch.toml", "log_level = \"error\"\n").string();
+    const NotifySocket systemd(dir.file("notify"));
+    const std::vector<std::string> withConfig{"--config", config};
+    ToolProcess daemon(daemonArguments(bus, {kExamples + "/taps.json"}, "0") + withConfig, systemd.setup());
+    ASSERT_EQ(systemd.next(), "READY=1");
+
+    const struct {
+        std::string file;
+        std::string logged;
+    } reloads[] = {
+        {"log_level = \"default\"\n[keys]\ntap.middle = \"KEY_MUTE\"\n",
+         "] default: configuration reloaded from " + config + "\n"},
+        {"log_level = \"error\"\n[keys]\ntap.middle = \"KEY_NOPE\"\n",
+         "] error: configuration not reloaded, the previous one stays in force: " + config +
+             ":3:14: unknown key name \"KEY_NOPE\""},
+    };
+    for (const auto& reload : reloads) {
+        dir.file("veltotouch.toml", reload.file);
+        daemon.signal(SIGHUP);
+        EXPECT_TRUE(systemd.next().starts_with("RELOADING=1\nMONOTONIC_USEC="));
+        EXPECT_EQ(systemd.next(), "READY=1");
+        EXPECT_EQ(ctl(bus, {"devices"}).out, "0  sim:" + kExamples + "/taps.json\n");
+    }
+    daemon.signal(SIGTERM);
+    const ToolProcess::Result ended = daemon.finish(kDeadline);
+    ASSERT_TRUE(ended.exited) << "ended by signal " << ended.signal << "\n" << ended.err;
+    EXPECT_EQ(ended.status, 0) << ended.err;
+    for (const auto& reload : reloads) EXPECT_NE(ended.err.find(reload.logged), std::string::npos) << ended.err;
+    // Logged at the level the first reload set: the bad file did not change it.
+    EXPECT_NE(ended.err.find("] default: stopping: taking 1 devices apart\n"), std::string::npos) << ended.err;
 }

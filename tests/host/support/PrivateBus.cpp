@@ -96,6 +96,15 @@ PrivateBus::PrivateBus(const std::string& policy, const std::string& type, const
     }
 }
 
+void PrivateBus::kill()
+{
+    if (!_daemon) return;
+    _daemon->signal(SIGKILL);
+    _daemon->finish(ToolProcess::Seconds(10));
+    // Reaped: its process id may be reused, so nothing signals it again.
+    _daemon.reset();
+}
+
 PrivateBus::~PrivateBus()
 {
     if (_daemon) {

@@ -31,6 +31,10 @@ public:
     const std::string& error() const { return _error; }
     const std::string& directory() const { return _directory; }
 
+    // Ends the bus at once (SIGKILL), as a crash of the bus would: every
+    // connection to it breaks. The address is left for clients to fail on.
+    void kill();
+
 private:
     std::string _directory;
     std::string _address;
