@@ -3,6 +3,7 @@
 #include "CtlCommand.h"
 #include "DaemonCommand.h"
 #include "DumpCommand.h"
+#include "EmulateCommand.h"
 #include "EvalCommand.h"
 #include "FiniteNumberCheck.h"
 #include "HostCommand.h"
@@ -287,6 +288,43 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
         ->check(argumentCheck("A:B", [](const std::string& text) { DumpCommand::parseRange(text); }));
     reportCommand->add_option("--title", report.title, "Title of the page (default: the recording's file name)");
 
+    EmulateCommand::Options emulate;
+    auto* emulateCommand =
+        app.add_subcommand("emulate", "Make a virtual surface through /dev/uhid and play a recording into it");
+    emulateCommand->add_option("FILE", emulate.file, "Recording container (JSON)")->required();
+    // Ids and durations as the daemon's configuration writes them: 0xHEX or decimal.
+    const auto emulateNumber = [&](const char* name, const char* type, std::uint32_t largest, auto& target,
+                                   const char* description) {
+        emulateCommand
+            ->add_option_function<std::string>(
+                name,
+                [&target, largest](const std::string& text) {
+                    target = static_cast<std::remove_reference_t<decltype(target)>>(
+                        EmulateCommand::parseNumber(text, largest));
+                },
+                description)
+            ->type_name(type)
+            ->check(argumentCheck("", [largest](const std::string& text) {
+                EmulateCommand::parseNumber(text, largest);
+            }));
+    };
+    emulateNumber("--vendor", "ID", 0xFFFF, emulate.vendor, "USB vendor id, 0xHEX or decimal (default 0x1234)");
+    emulateNumber("--product", "ID", 0xFFFF, emulate.product, "USB product id (default 0x5678)");
+    emulateCommand
+        ->add_option("--speed", emulate.speed,
+                     "Play S times faster than recorded, S at least 0.001 (0: as fast as the kernel takes the reports)")
+        ->capture_default_str()
+        ->check(speedCheck());
+    emulateCommand
+        ->add_option("--max-gap", emulate.maxGapSeconds, "Wait at most this many seconds for one gap between reports")
+        ->check(FiniteNumberCheck(0))
+        ->capture_default_str();
+    emulateCommand->add_flag("--loop", emulate.loop, "Play the recording again and again until interrupted");
+    emulateNumber("--hold-duration", "MS", 0xFFFFFFFF, emulate.holdDurationMs,
+                  "Factory-reset hold duration the device reports (default 5000)");
+    // Hidden from help: the uhid node elsewhere (the tests name one that is not there).
+    emulateCommand->add_option("--uhid", emulate.uhidPath, "uhid node")->group("");
+
     std::string helpTopic;
     auto* helpCommand = app.add_subcommand("help", "Describe the commands, or one COMMAND and its options");
     helpCommand->add_option("COMMAND", helpTopic, "Command to describe");
@@ -355,6 +393,8 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             return DaemonCommand::run(daemon);
         } else if (*ctlCommand) {
             return CtlCommand::run(ctl, out, err);
+        } else if (*emulateCommand) {
+            return EmulateCommand::run(emulate, err);
         }
     } catch (const std::exception& error) {
         err << "veltotouch: " << error.what() << '\n';

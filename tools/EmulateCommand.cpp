@@ -1,0 +1,272 @@
+#include "EmulateCommand.h"
+
+#include "ToolError.h"
+#include "ToolFiles.h"
+#include "host/GapCap.h"
+#include "host/StopSignals.h"
+#include "platform/UhidDevice.h"
+#include "records/FeatureReport.h"
+#include "records/InputReport.h"
+#include "records/LittleEndian.h"
+#include "recording/PipelineRecording.h"
+#include "service/VeltoTouchHIDService.h"
+
+#include <linux/input.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+#include <chrono>
+#include <cstdio>
+#include <optional>
+#include <vector>
+
+namespace VeltoTool {
+
+using VeltoHost::GapCap;
+using VeltoHost::UhidDevice;
+using VeltoTouch::PipelineRecording;
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+using Service = VeltoTouch::VeltoTouchHIDService;
+using HoldDuration = VeltoTouch::FeatureReport::FactoryResetHoldDuration;
+
+constexpr const char* kDeviceName = "VeltoTouch virtual surface";
+
+// Report descriptor short items: tag and type, with the number of data bytes
+// that follow in the low two bits.
+constexpr std::uint8_t kUsagePage16 = 0x06;
+constexpr std::uint8_t kUsage8 = 0x09;
+constexpr std::uint8_t kCollection8 = 0xA1;
+constexpr std::uint8_t kEndCollection = 0xC0;
+constexpr std::uint8_t kLogicalMinimum8 = 0x15;
+constexpr std::uint8_t kLogicalMaximum16 = 0x26;
+constexpr std::uint8_t kReportSize8 = 0x75;
+constexpr std::uint8_t kReportID8 = 0x85;
+constexpr std::uint8_t kReportCount16 = 0x96;
+constexpr std::uint8_t kInput8 = 0x81;
+constexpr std::uint8_t kFeature8 = 0xB1;
+constexpr std::uint8_t kApplicationCollection = 0x01;
+constexpr std::uint8_t kDataVariableAbsolute = 0x02;
+
+// The surface sits in one application collection on the vendor-defined usage
+// page 0xFF00, usage 0x01: no input driver of the kernel takes such a device,
+// so its reports reach readers through hidraw alone, as the real surface's do.
+constexpr std::uint16_t kVendorUsagePage = 0xFF00;
+constexpr std::uint8_t kSurfaceUsage = 0x01;
+
+// When a schedule has fallen behind (a slow kernel), at most this much of the
+// delay is made up at once: reports are not sent in a burst.
+constexpr auto kCatchUpLimit = std::chrono::milliseconds(20);
+
+// One report: a run of bytes (8-bit fields, 0 to 255) whose usage is its ID.
+// `length` counts the ID, as the plug-in's lengths do.
+void appendReport(std::vector<std::uint8_t>& descriptor, std::uint8_t mainItem, std::uint8_t reportID,
+                  std::size_t length)
+{
+    const auto count = static_cast<std::uint16_t>(length - 1);
+    descriptor.insert(descriptor.end(), {kReportID8, reportID, kUsage8, reportID, kReportCount16,
+                                         static_cast<std::uint8_t>(count), static_cast<std::uint8_t>(count >> 8),
+                                         mainItem, kDataVariableAbsolute});
+}
+
+// The kernel drops input reports whose ID the descriptor does not declare,
+// and pads shorter ones: both input reports are declared at the length the
+// plug-in parses. The feature reports are declared at the length the plug-in
+// reads them with (its buffer for the debug reports, the parsed layout for
+// the hold duration), so that hidraw readers see what the device would send.
+std::vector<std::uint8_t> surfaceDescriptor()
+{
+    constexpr auto kPageLow = static_cast<std::uint8_t>(kVendorUsagePage);
+    constexpr auto kPageHigh = static_cast<std::uint8_t>(kVendorUsagePage >> 8);
+    std::vector<std::uint8_t> descriptor = {
+        kUsagePage16,      kPageLow, kPageHigh,
+        kUsage8,           kSurfaceUsage,
+        kCollection8,      kApplicationCollection,
+        kLogicalMinimum8,  0x00,
+        kLogicalMaximum16, 0xFF, 0x00,
+        kReportSize8,      8,
+    };
+    using namespace VeltoTouch::InputReport;
+    appendReport(descriptor, kInput8, Image::kReportID, Image::kLength);
+    appendReport(descriptor, kInput8, FirmwareEvent::kReportID, FirmwareEvent::kLength);
+    appendReport(descriptor, kFeature8, HoldDuration::kReportID, HoldDuration::kLength);
+    for (std::uint8_t reportID : Service::kFirmwareDebugReportIDs) {
+        appendReport(descriptor, kFeature8, reportID, Service::kFirmwareDebugReportBufferSize);
+    }
+    descriptor.push_back(kEndCollection);
+    return descriptor;
+}
+
+// The hold duration as the plug-in parses it; each debug report is its ID
+// over its whole length, recognisable in the plug-in's hex text (a shift or
+// a cut shows); any other ID is refused.
+std::optional<std::vector<std::uint8_t>> surfaceFeatureReport(std::uint8_t reportID, std::uint32_t holdDurationMs)
+{
+    if (reportID == HoldDuration::kReportID) {
+        std::vector<std::uint8_t> report(HoldDuration::kLength);
+        report[0] = reportID;
+        VeltoTouch::LittleEndian::putU32(&report[1], holdDurationMs);
+        return report;
+    }
+    const auto& debugIDs = Service::kFirmwareDebugReportIDs;
+    if (std::find(debugIDs.begin(), debugIDs.end(), reportID) != debugIDs.end()) {
+        return std::vector<std::uint8_t>(Service::kFirmwareDebugReportBufferSize, reportID);
+    }
+    return std::nullopt;
+}
+
+std::string hex4(std::uint16_t number)
+{
+    char text[8];
+    std::snprintf(text, sizeof text, "%04x", number);
+    return text;
+}
+
+// Thrown from the recording's frame handler to end the playback.
+struct PlaybackStopped {};
+
+// Where the playback stands, across the passes of a loop.
+struct Playback {
+    const EmulateCommand::Options& options;
+    UhidDevice& device;
+    const EmulateCommand::StopCheck& stopRequested;
+    std::ostream& err;
+    GapCap gapCap;
+    std::optional<std::uint64_t> previousReportNs;
+    Clock::time_point deadline;
+};
+
+void failIfBroken(const UhidDevice& device)
+{
+    if (!device.error().empty()) throw ToolError(device.error());
+}
+
+// Made at the first input report, so that a recording that fails at its
+// start never makes a device appear and vanish; played once a reader has it
+// open, so that no report is lost while a daemon notices the new device.
+void createAndWaitForReader(Playback& playback)
+{
+    const EmulateCommand::Options& options = playback.options;
+    const UhidDevice::Identity identity{kDeviceName, BUS_USB, options.vendor, options.product, 0, 0,
+                                        surfaceDescriptor()};
+    if (!playback.device.create(identity)) failIfBroken(playback.device);
+    playback.err << "veltotouch: " << kDeviceName << " " << hex4(options.vendor) << ":" << hex4(options.product)
+                 << " made; playing " << options.file << " once a reader opens it (Ctrl-C to stop)" << std::endl;
+    if (!playback.device.waitUntilOpened(playback.stopRequested)) {
+        failIfBroken(playback.device);
+        throw PlaybackStopped{};
+    }
+}
+
+// Waits for the report's place in the schedule, answering requests meanwhile.
+void waitForTurn(Playback& playback, std::uint64_t timestampNs)
+{
+    UhidDevice& device = playback.device;
+    if (playback.options.speed == 0) {
+        if (!device.servePending()) failIfBroken(device);
+        return;
+    }
+    const Clock::time_point now = Clock::now();
+    if (!playback.previousReportNs) {
+        playback.deadline = now;
+    } else if (timestampNs > *playback.previousReportNs) {
+        // In floating point: a gap of 2^64 ns at a speed below 1 saturates rather than wraps.
+        const double microseconds =
+            static_cast<double>(timestampNs - *playback.previousReportNs) / playback.options.speed / 1000.0;
+        const auto wait = std::chrono::microseconds(playback.gapCap(GapCap::wholeMicroseconds(microseconds)));
+        playback.deadline = std::max(playback.deadline, now - kCatchUpLimit) + wait;
+    }
+    playback.previousReportNs = timestampNs;
+    if (!device.serveUntil(playback.deadline, playback.stopRequested)) failIfBroken(device);
+}
+
+// One pass over the recording; returns the number of input reports played.
+std::uint64_t playPass(Playback& playback, ToolFiles::File file)
+{
+    std::uint64_t played = 0;
+    playback.previousReportNs.reset();
+    const auto stopped = !ToolFiles::streamRecording(
+        file.get(), playback.options.file,
+        [&](PipelineRecording::Frame&& frame) {
+            // State frames are settings of the plug-in's pipeline, not something the device sends.
+            if (frame.type != PipelineRecording::Frame::Type::InputReport) return;
+            if (!playback.device.isCreated()) createAndWaitForReader(playback);
+            waitForTurn(playback, frame.timestampNs);
+            if (playback.stopRequested()) throw PlaybackStopped{};
+            if (!playback.device.sendInputReport(frame.report.data(), frame.report.size())) {
+                failIfBroken(playback.device);
+            }
+            ++played;
+        },
+        playback.stopRequested);
+    if (stopped) throw PlaybackStopped{};
+    if (played == 0) throw ToolError(playback.options.file + ": no input reports to play");
+    return played;
+}
+
+int emulate(const EmulateCommand::Options& options, ToolFiles::File first, UhidDevice& device,
+            const EmulateCommand::StopCheck& stopRequested, std::ostream& err)
+{
+    Playback playback{options, device, stopRequested, err,
+                      GapCap(options.maxGapSeconds,
+                             [&err](const std::string& note) { err << "veltotouch: note: " << note << std::endl; }),
+                      std::nullopt, Clock::now()};
+    try {
+        playPass(playback, std::move(first));
+        while (options.loop && !stopRequested()) playPass(playback, ToolFiles::openRecording(options.file));
+    } catch (const PlaybackStopped&) {
+    }
+    // A reader waiting for a feature report is answered before the unplug.
+    device.servePending();
+    device.destroy();
+    failIfBroken(device);
+    return 0;
+}
+
+UhidDevice::FeatureReportSource featureReports(const EmulateCommand::Options& options)
+{
+    return [hold = options.holdDurationMs](std::uint8_t reportID) { return surfaceFeatureReport(reportID, hold); };
+}
+
+}  // namespace
+
+int EmulateCommand::run(const Options& options, std::ostream& err)
+{
+    // Before any slow work: a stop from here on removes the device in order.
+    VeltoHost::StopSignals signals;
+    ToolFiles::File recording = ToolFiles::openRecording(options.file);
+    std::string error;
+    const int fd = UhidDevice::openNode(options.uhidPath, error);
+    if (fd < 0) throw ToolError(error);
+    UhidDevice device(fd, featureReports(options));
+    return emulate(options, std::move(recording), device, &VeltoHost::StopSignals::requested, err);
+}
+
+int EmulateCommand::run(const Options& options, int uhidFd, const StopCheck& stopRequested, std::ostream& err)
+{
+    UhidDevice device(uhidFd, featureReports(options));
+    return emulate(options, ToolFiles::openRecording(options.file), device, stopRequested, err);
+}
+
+std::uint32_t EmulateCommand::parseNumber(const std::string& text, std::uint32_t largest)
+{
+    const bool hex = text.size() > 2 && text[0] == '0' && (text[1] == 'x' || text[1] == 'X');
+    const char* begin = text.data() + (hex ? 2 : 0);
+    const char* end = text.data() + text.size();
+    std::uint64_t number = 0;
+    const auto [stop, error] = std::from_chars(begin, end, number, hex ? 16 : 10);
+    if (text.empty() || error == std::errc::invalid_argument || stop != end) {
+        throw ToolError("expected a number (decimal, or hexadecimal after 0x), got \"" + text + "\"");
+    }
+    if (error == std::errc::result_out_of_range || number > largest) {
+        char bound[32];
+        std::snprintf(bound, sizeof bound, "%u (0x%x)", largest, largest);
+        throw ToolError("must be at most " + std::string(bound) + ", got " + text);
+    }
+    return static_cast<std::uint32_t>(number);
+}
+
+}  // namespace VeltoTool
