@@ -46,6 +46,8 @@ TEST(Cli, UsageErrorsExitWithTwoAndOneLineThatNamesTheProblem)
         {{"daemon", "--device", "sim:", "--no-udev"}, "sim: needs a recording after the colon"},
         {{"daemon", "--config", "/no/such.toml"}, "--config: File does not exist: /no/such.toml"},
         {{"ctl", "set", "NoEquals"}, "expected KEY=VALUE, got \"NoEquals\""},
+        {{"ctl", "--bus", "foo", "devices"}, "\"foo\" is not a bus: give system, session or a D-Bus address"},
+        {{"daemon", "--bus", "foo", "--no-udev"}, "\"foo\" is not a bus"},
         {{"ctl", "get", "-d", "first", "Pipeline.Algs.EventStats"}, "-d"},
         {{"help", "frobnicate"}, "help: no command \"frobnicate\""},
         {{"replay", kTaps, "--check", kTaps, "--get", "DebugInfo"}, "--check compares instead of printing"},

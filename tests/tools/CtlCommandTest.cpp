@@ -144,13 +144,3 @@ TEST(CtlCommandTest, WritesThatCannotHoldAreToldAndLargeValuesCostTheDaemonNothi
     }
     EXPECT_EQ(stop(*daemon, SIGTERM).status, 0);
 }
-
-TEST(CtlCommandTest, ABusThatIsNeitherANameNorAnAddressIsAUsageError)
-{
-    for (const std::string command : {"ctl", "daemon"}) {
-        const ToolRun run = runTool({command, "--bus", "foo", command == "ctl" ? "devices" : "--no-udev"});
-        EXPECT_EQ(run.status, 2) << command;
-        EXPECT_NE(run.err.find("\"foo\" is not a bus: give system, session or a D-Bus address"), std::string::npos)
-            << run.err;
-    }
-}
