@@ -10,6 +10,10 @@
 set -euo pipefail
 here=$(cd "$(dirname "$0")" && pwd)
 vm=$here/vm
+# The VM sees the host's root but not its /tmp, apart from the current
+# directory: run from here, so that this file is there inside too when the
+# tree is checked out under /tmp.
+cd "$here"
 
 fail() {
     echo "smoke: $*" >&2
