@@ -1,5 +1,6 @@
 #include "Cli.h"
 
+#include "ConvertCommand.h"
 #include "CtlCommand.h"
 #include "DaemonCommand.h"
 #include "DumpCommand.h"
@@ -113,6 +114,14 @@ std::string usageLine(const CLI::App& app, const CLI::ParseError& error, int arg
     return "veltotouch: " + message + " (see '" + help + "')";
 }
 
+// Where a command reads recordings: which device of a hid-recorder file.
+void addHidDeviceOption(CLI::App* command, std::optional<std::uint32_t>& device)
+{
+    command->add_option("--hid-device", device,
+                        "N: of a hid-recorder file holding several devices, the one to read (default: the one whose "
+                        "report descriptor declares the surface's reports)");
+}
+
 std::vector<std::pair<std::string, std::string>> splitAll(const std::vector<std::string>& arguments)
 {
     std::vector<std::pair<std::string, std::string>> out;
@@ -133,7 +142,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     ReplayCommand::Options replay;
     std::vector<std::string> replaySets;
     auto* replayCommand = app.add_subcommand("replay", "Play a recording through a fresh pipeline and print its gestures");
-    replayCommand->add_option("FILE", replay.file, "Recording container (JSON)")->required();
+    replayCommand->add_option("FILE", replay.file, "Recording (container, or hid-recorder text)")->required();
     replayCommand
         ->add_option("--speed", replay.speed,
                      "Pace like the recording, S times faster, S at least 0.001 (default 0: as fast as possible)")
@@ -152,6 +161,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     replayCommand->add_option("--check", replay.check,
                               "EXPECTED: compare the events (and the values it holds) with this file of --jsonl "
                               "lines instead of printing them; exit 1 at the first difference");
+    addHidDeviceOption(replayCommand, replay.hidDevice);
 
     SynthCommand::Options synth;
     auto* synthCommand = app.add_subcommand("synth", "Write a recording made from a gesture script");
@@ -197,13 +207,15 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
         }));
     evalCommand->add_flag("--merge", eval.merge, "FILEs are reports of eval --json (shards); print them added up");
     evalCommand->add_flag("--json", eval.json, "One JSON document instead of tables");
+    addHidDeviceOption(evalCommand, eval.hidDevice);
 
     DumpCommand::Options dump;
     auto* dumpCommand = app.add_subcommand("dump", "Draw each Image report of a recording over the pad layout");
-    dumpCommand->add_option("FILE", dump.file, "Recording container (JSON)")->required();
+    dumpCommand->add_option("FILE", dump.file, "Recording (container, or hid-recorder text)")->required();
     dumpCommand->add_option("--frames", dump.frames, "A:B, inclusive range of frame numbers (either side may be left out)")
         ->check(argumentCheck("A:B", [](const std::string& text) { DumpCommand::parseRange(text); }));
     dumpCommand->add_flag("--levels", dump.levels, "Draw the levels instead of the readings");
+    addHidDeviceOption(dumpCommand, dump.hidDevice);
 
     HostCommand::Options host;
     std::vector<std::string> hostSets;
@@ -224,6 +236,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     hostCommand->add_option("--save-recording", host.saveRecording, "Write the plug-in's \"Recording\" property here at the end");
     hostCommand->add_flag("--jsonl", host.jsonLines, "One JSON object per line");
     hostCommand->add_flag("--summary", host.summary, "Print the gesture counters at the end");
+    addHidDeviceOption(hostCommand, host.hidDevice);
 
     DaemonCommand::Options daemon;
     auto* daemonCommand = app.add_subcommand("daemon", "Serve touch devices on D-Bus and turn their gestures into keys");
@@ -280,18 +293,19 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     ReportCommand::Options report;
     std::vector<std::string> reportSets;
     auto* reportCommand = app.add_subcommand("report", "Replay a recording into a self-contained HTML page");
-    reportCommand->add_option("FILE", report.file, "Recording container (JSON)")->required();
+    reportCommand->add_option("FILE", report.file, "Recording (container, or hid-recorder text)")->required();
     reportCommand->add_option("-o,--output", report.output, "HTML page to write")->required();
     reportCommand->add_option("--set", reportSets, "KEY=VALUE: pipeline state before the first frame (VALUE is JSON)")
         ->check(settingCheck());
     reportCommand->add_option("--frames", report.frames, "A:B, inclusive range of frame numbers to show")
         ->check(argumentCheck("A:B", [](const std::string& text) { DumpCommand::parseRange(text); }));
     reportCommand->add_option("--title", report.title, "Title of the page (default: the recording's file name)");
+    addHidDeviceOption(reportCommand, report.hidDevice);
 
     EmulateCommand::Options emulate;
     auto* emulateCommand =
         app.add_subcommand("emulate", "Make a virtual surface through /dev/uhid and play a recording into it");
-    emulateCommand->add_option("FILE", emulate.file, "Recording container (JSON)")->required();
+    emulateCommand->add_option("FILE", emulate.file, "Recording (container, or hid-recorder text)")->required();
     // Ids and durations as the daemon's configuration writes them: 0xHEX or decimal.
     const auto emulateNumber = [&](const char* name, const char* type, std::uint32_t largest, auto& target,
                                    const char* description) {
@@ -324,6 +338,19 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
                   "Factory-reset hold duration the device reports (default 5000)");
     // Hidden from help: the uhid node elsewhere (the tests name one that is not there).
     emulateCommand->add_option("--uhid", emulate.uhidPath, "uhid node")->group("");
+
+    ConvertCommand::Options convert;
+    auto* convertCommand =
+        app.add_subcommand("convert", "Write a recording container as a hid-recorder text, or such a text as a container");
+    convertCommand->add_option("IN", convert.input, "Recording (container, or hid-recorder text)")->required();
+    convertCommand->add_option("-o,--output", convert.output, "File to write")->required();
+    convertCommand
+        ->add_option_function<std::string>(
+            "--format", [&](const std::string& text) { convert.format = ConvertCommand::parseFormat(text); },
+            "container or hid (default: the other format than IN's)")
+        ->type_name("FORMAT")
+        ->check(argumentCheck("container|hid", [](const std::string& text) { ConvertCommand::parseFormat(text); }));
+    addHidDeviceOption(convertCommand, convert.hidDevice);
 
     std::string helpTopic;
     auto* helpCommand = app.add_subcommand("help", "Describe the commands, or one COMMAND and its options");
@@ -395,6 +422,8 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             return CtlCommand::run(ctl, out, err);
         } else if (*emulateCommand) {
             return EmulateCommand::run(emulate, err);
+        } else if (*convertCommand) {
+            ConvertCommand::run(convert, err);
         }
     } catch (const std::exception& error) {
         err << "veltotouch: " << error.what() << '\n';

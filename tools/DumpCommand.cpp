@@ -44,7 +44,7 @@ DumpCommand::FrameRange DumpCommand::parseRange(const std::string& text)
 void DumpCommand::run(const Options& options, std::ostream& out)
 {
     const FrameRange range = parseRange(options.frames);
-    const VeltoTouch::PipelineRecording recording = ToolFiles::readRecording(options.file);
+    const VeltoTouch::PipelineRecording recording = ToolFiles::readRecording(options.file, options.hidDevice);
     for (const auto& frame : recording.frames()) {
         if (frame.type != VeltoTouch::PipelineRecording::Frame::Type::InputReport) continue;
         auto image = VeltoTouch::InputReport::Image::parse(frame.report.data(), frame.report.size());

@@ -17,6 +17,9 @@ public:
         std::string frames;
         // Draw the levels instead of the readings.
         bool levels = false;
+        // Of a hid-recorder file holding several devices, the one to read;
+        // empty: the one with the surface's reports.
+        std::optional<std::uint32_t> hidDevice;
     };
 
     static void run(const Options& options, std::ostream& out);

@@ -287,8 +287,8 @@ int EvalCommand::run(const Options& options, std::ostream& out, std::ostream& er
     }
     const std::vector<EvaluationResult> results = CorpusEvaluator::run(
         corpus, rowSettings, workers,
-        [](const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame) {
-            ToolFiles::streamRecording(path, onFrame);
+        [&options](const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame) {
+            ToolFiles::streamRecording(path, onFrame, options.hidDevice);
         },
         progress);
     bar.reset();

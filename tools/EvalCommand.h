@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstdint>
+#include <optional>
 #include <ostream>
 #include <string>
 #include <utility>
@@ -29,6 +31,9 @@ public:
         std::string shard;
         bool merge = false;
         bool json = false;
+        // Of a hid-recorder file holding several devices, the one to read;
+        // empty: the one with the surface's reports.
+        std::optional<std::uint32_t> hidDevice;
     };
 
     // Returns the exit status: 2 for options that do not go together or a

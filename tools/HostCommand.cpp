@@ -152,7 +152,7 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
                     if (!player.play(frame)) throw PlaybackStopped{};
                     played = true;
                 },
-                &StopSignals::requested);
+                &StopSignals::requested, options.hidDevice);
         } catch (const PlaybackStopped&) {
             stopped = true;
         } catch (const ToolError& error) {

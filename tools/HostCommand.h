@@ -3,6 +3,7 @@
 #include "host/GapCap.h"
 
 #include <cstdint>
+#include <optional>
 #include <ostream>
 #include <string>
 #include <utility>
@@ -31,6 +32,9 @@ public:
         std::string saveRecording;
         bool jsonLines = false;
         bool summary = false;
+        // Of a hid-recorder file holding several devices, the one to read;
+        // empty: the one with the surface's reports.
+        std::optional<std::uint32_t> hidDevice;
     };
 
     // Returns the exit status; throws ToolError for what the user can fix.

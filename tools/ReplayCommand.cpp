@@ -73,7 +73,7 @@ int ReplayCommand::run(const Options& options, std::ostream& out, std::ostream& 
             clock.reset();
         }
         PipelineRecording::playFrame(frame, clock, *firstTimestampNs, speed, sleep, pipeline.get());
-    });
+    }, options.hidDevice);
     pipeline->setDecisionObserver(nullptr);
 
     if (!check) {

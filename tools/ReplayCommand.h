@@ -2,6 +2,8 @@
 
 #include "host/GapCap.h"
 
+#include <cstdint>
+#include <optional>
 #include <ostream>
 #include <string>
 #include <utility>
@@ -30,6 +32,9 @@ public:
         // A file of expected events and values (as --jsonl prints them) to
         // compare the replay with, instead of printing it.
         std::string check;
+        // Of a hid-recorder file holding several devices, the one to read;
+        // empty: the one with the surface's reports.
+        std::optional<std::uint32_t> hidDevice;
     };
 
     // Writes events, dumps and reads to `out`; warnings and notes to `err`.

@@ -36,7 +36,7 @@ void ReportCommand::run(const Options& options, std::ostream& err)
     StateArguments::apply(*pipeline, options.settings, err);
     out.stream() << RecordingReport::html(
         [&](const std::function<void(VeltoTouch::PipelineRecording::Frame&&)>& play) {
-            return *ToolFiles::streamRecording(recording.get(), options.file, play);
+            return *ToolFiles::streamRecording(recording.get(), options.file, play, {}, options.hidDevice);
         },
         pipeline, report);
     out.commit();

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstdint>
+#include <optional>
 #include <ostream>
 #include <string>
 #include <utility>
@@ -21,6 +23,9 @@ public:
         std::string frames;
         // Default: the recording's file name.
         std::string title;
+        // Of a hid-recorder file holding several devices, the one to read;
+        // empty: the one with the surface's reports.
+        std::optional<std::uint32_t> hidDevice;
     };
 
     // Warnings go to `err`. Throws ToolError or the recording's own errors.

@@ -2,6 +2,7 @@
 
 #include "ToolError.h"
 #include "recording/ContainerReadAhead.h"
+#include "recording/HidRecorderReader.h"
 #include "recording/JsonValue.h"
 
 #include <fcntl.h>
@@ -56,6 +57,13 @@ std::string describeUnreadable(const std::string& path, const std::string& text,
     return path + ": JSON, but not an object at the top level, " + expected + " (" + message + ")";
 }
 
+// A fault of a hid-recorder text, where it is: PATH:LINE: what.
+ToolError hidRecorderFault(const std::string& path, const VeltoTouch::HidRecorderReader::Fault& fault)
+{
+    const std::string place = fault.line() == 0 ? path : path + ":" + std::to_string(fault.line());
+    return ToolError(place + ": " + fault.reason());
+}
+
 }  // namespace
 
 std::string ToolFiles::read(const std::string& path)
@@ -64,10 +72,10 @@ std::string ToolFiles::read(const std::string& path)
     return readText(path);
 }
 
-VeltoTouch::PipelineRecording ToolFiles::readRecording(const std::string& path)
+VeltoTouch::PipelineRecording ToolFiles::readRecording(const std::string& path, std::optional<std::uint32_t> hidDevice)
 {
     if (isDirectory(path)) throw ToolError(path + ": is a directory, " + std::string(kExpectedRecording));
-    return recordingFromText(path, read(path));
+    return recordingFromText(path, read(path), hidDevice);
 }
 
 std::string ToolFiles::readText(const std::string& path)
@@ -92,10 +100,13 @@ std::string ToolFiles::readText(const std::string& path)
     return text;
 }
 
-VeltoTouch::PipelineRecording ToolFiles::recordingFromText(const std::string& path, const std::string& text)
+VeltoTouch::PipelineRecording ToolFiles::recordingFromText(const std::string& path, const std::string& text,
+                                                         std::optional<std::uint32_t> hidDevice)
 {
     try {
-        return VeltoTouch::PipelineRecording{std::string_view(text)};
+        return VeltoTouch::PipelineRecording{std::string_view(text), hidDevice};
+    } catch (const VeltoTouch::HidRecorderReader::Fault& fault) {
+        throw hidRecorderFault(path, fault);
     } catch (const std::exception& error) {
         throw ToolError(describeUnreadable(path, text, error.what()));
     }
@@ -112,14 +123,17 @@ ToolFiles::File ToolFiles::openRecording(const std::string& path)
 
 std::optional<std::uint64_t> ToolFiles::streamRecording(std::FILE* file, const std::string& path,
                                                         const VeltoTouch::ContainerStream::FrameHandler& onFrame,
-                                                        const std::function<bool()>& stopRequested)
+                                                        const std::function<bool()>& stopRequested,
+                                                        std::optional<std::uint32_t> hidDevice)
 {
     std::uint64_t version = 0;
     try {
         // Read through the descriptor: stdio's buffer is never used.
-        version = VeltoTouch::ContainerReadAhead::read(::fileno(file), onFrame, stopRequested);
+        version = VeltoTouch::ContainerReadAhead::read(::fileno(file), onFrame, stopRequested, hidDevice);
     } catch (const ToolError&) {
         throw;
+    } catch (const VeltoTouch::HidRecorderReader::Fault& fault) {
+        throw hidRecorderFault(path, fault);
     } catch (const std::exception& error) {
         if (stopRequested && stopRequested()) return std::nullopt;
         const std::string message = error.what();
@@ -135,10 +149,11 @@ std::optional<std::uint64_t> ToolFiles::streamRecording(std::FILE* file, const s
 }
 
 std::uint64_t ToolFiles::streamRecording(const std::string& path,
-                                         const VeltoTouch::ContainerStream::FrameHandler& onFrame)
+                                         const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+                                         std::optional<std::uint32_t> hidDevice)
 {
     const File file = openRecording(path);
-    return *streamRecording(file.get(), path, onFrame);
+    return *streamRecording(file.get(), path, onFrame, {}, hidDevice);
 }
 
 }  // namespace VeltoTool

@@ -20,11 +20,14 @@ public:
     // The whole file; a directory is refused rather than read as empty text.
     static std::string read(const std::string& path);
 
-    // A recording read from a container file. Every failure is one line that
-    // starts with the path: a directory, an empty file and text that is not
-    // JSON are told apart from a container with faults, whose own message is
-    // kept.
-    static VeltoTouch::PipelineRecording readRecording(const std::string& path);
+    // A recording read from a container file, or from a hid-recorder text
+    // (told apart by its content; `hidDevice` names the device to read of
+    // one that holds several, else the surface's is read). Every failure is
+    // one line that starts with the path: a directory, an empty file and text
+    // that is not JSON are told apart from a container with faults, whose own
+    // message is kept; a fault in a hid-recorder text is PATH:LINE: what.
+    static VeltoTouch::PipelineRecording readRecording(const std::string& path,
+                                                       std::optional<std::uint32_t> hidDevice = std::nullopt);
 
     // A recording file opened for streamRecording, so that a path that cannot
     // be read is refused before anything starts.
@@ -40,14 +43,17 @@ public:
     // that interrupts a blocked read cuts the input short).
     static std::optional<std::uint64_t> streamRecording(std::FILE* file, const std::string& path,
                                                         const VeltoTouch::ContainerStream::FrameHandler& onFrame,
-                                                        const std::function<bool()>& stopRequested = {});
+                                                        const std::function<bool()>& stopRequested = {},
+                                                        std::optional<std::uint32_t> hidDevice = std::nullopt);
     static std::uint64_t streamRecording(const std::string& path,
-                                         const VeltoTouch::ContainerStream::FrameHandler& onFrame);
+                                         const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+                                         std::optional<std::uint32_t> hidDevice = std::nullopt);
 
 private:
     // The whole file, read in pieces (a read interrupted by a signal goes on).
     static std::string readText(const std::string& path);
-    static VeltoTouch::PipelineRecording recordingFromText(const std::string& path, const std::string& text);
+    static VeltoTouch::PipelineRecording recordingFromText(const std::string& path, const std::string& text,
+                                                           std::optional<std::uint32_t> hidDevice);
 };
 
 }  // namespace VeltoTool

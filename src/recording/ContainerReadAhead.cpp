@@ -27,7 +27,8 @@ struct Abandoned {};
 }  // namespace
 
 std::uint64_t ContainerReadAhead::read(int fd, const ContainerStream::FrameHandler& onFrame,
-                                       const std::function<bool()>& stopRequested)
+                                       const std::function<bool()>& stopRequested,
+                                       std::optional<std::uint32_t> hidDevice)
 {
     std::mutex mutex;
     std::condition_variable changed;
@@ -59,7 +60,7 @@ std::uint64_t ContainerReadAhead::read(int fd, const ContainerStream::FrameHandl
                     batch.push_back(std::move(frame));
                     if (batch.size() == kFramesPerBatch) handOver(true);
                 },
-                [&] { return abandoned || (stopRequested && stopRequested()); });
+                [&] { return abandoned || (stopRequested && stopRequested()); }, hidDevice);
         } catch (const Abandoned&) {
             return;
         } catch (...) {

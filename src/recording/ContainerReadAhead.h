@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <optional>
 
 namespace VeltoTouch {
 
@@ -21,7 +22,8 @@ namespace VeltoTouch {
 class ContainerReadAhead {
 public:
     static std::uint64_t read(int fd, const ContainerStream::FrameHandler& onFrame,
-                              const std::function<bool()>& stopRequested = {});
+                              const std::function<bool()>& stopRequested = {},
+                              std::optional<std::uint32_t> hidDevice = std::nullopt);
 };
 
 }  // namespace VeltoTouch

@@ -1,6 +1,8 @@
 #include "recording/ContainerStream.h"
 
 #include "recording/ContainerFrames.h"
+#include "recording/ContainerWriter.h"
+#include "recording/HidRecorderReader.h"
 #include "platform/PropertyDictionary.h"
 #include "recording/JsonValue.h"
 #include "recording/PropertyValueBuilder.h"
@@ -94,6 +96,17 @@ public:
     }
     // The first bytes, when there are four (a byte order mark is looked for).
     const Ch* Peek4() const { return _current + 4 <= _last ? _current : nullptr; }
+
+    // Everything not taken yet, piece by piece as it is read (a text that is
+    // not JSON is read this way, not by the parser).
+    template <typename Consume>
+    void forEachPiece(Consume consume)
+    {
+        while (!_ended) {
+            consume(std::string_view(_current, static_cast<std::size_t>(_last - _current + 1)));
+            refill();
+        }
+    }
 
     // Output is never asked of an input stream.
     void Put(Ch) {}
@@ -526,13 +539,29 @@ private:
 
 }  // namespace
 
-std::uint64_t ContainerStream::read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested)
+std::uint64_t ContainerStream::read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested,
+                                    std::optional<std::uint32_t> hidDevice)
 {
     const off_t start = ::lseek(fd, 0, SEEK_CUR);
     DescriptorInput input(fd, stopRequested);
     // A byte order mark is skipped, as the whole-text reader skips it.
     if (const char* first = input.Peek4(); first && std::memcmp(first, "\xEF\xBB\xBF", 3) == 0) {
         for (int i = 0; i < 3; ++i) input.Take();
+    }
+    // Blank space before the first character means nothing in either format;
+    // a hid-recorder text's line numbers count its line breaks, though.
+    std::uint64_t lineBreaks = 0;
+    while (input.Peek() == ' ' || input.Peek() == '\t' || input.Peek() == '\r' || input.Peek() == '\n') {
+        if (input.Take() == '\n') ++lineBreaks;
+    }
+    if (HidRecorderReader::opensWith(input.Peek())) {
+        HidRecorderReader reader(onFrame, hidDevice);
+        for (; lineBreaks > 0; --lineBreaks) reader.feed("\n");
+        input.forEachPiece([&](std::string_view piece) { reader.feed(piece); });
+        // Cut short by the stop: the last line may be a part of one.
+        if (stopRequested && stopRequested()) throw std::runtime_error("the read was stopped");
+        reader.finish();
+        return ContainerWriter::kVersion;
     }
     StreamHandler handler(onFrame);
     rapidjson::Reader reader;

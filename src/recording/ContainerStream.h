@@ -4,12 +4,19 @@
 
 #include <cstdint>
 #include <functional>
+#include <optional>
 
 namespace VeltoTouch {
 
 // Reads a recording container as it arrives and hands over each frame as
 // soon as it is complete, so that a recording of any length plays in bounded
 // memory: the frame objects one at a time, nothing else kept.
+//
+// A recording in the text of hid-recorder is read too, told apart by its
+// first character (HidRecorderReader::opensWith): its events, of the device
+// `hidDevice` or else of the surface's, become input report frames, and its
+// faults are HidRecorderReader::Fault. Every reader of recording files comes
+// through here or through PipelineRecording(data), so both take both.
 //
 // It accepts and refuses what PipelineRecording(data) does, with the same
 // messages, but each fault is raised where it is reached: the frames before
@@ -33,8 +40,10 @@ public:
     // open. When `stopRequested` turns true, the input ends there as if it
     // had been cut short (the caller, who asked, tells a stop from a fault),
     // also while waiting for input that has not come (a pipe). Returns the
-    // container's version (0 or 1) as it states it.
-    static std::uint64_t read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested = {});
+    // container's version (0 or 1) as it states it; for a hid-recorder text,
+    // the version whose frames it was read into (ContainerWriter::kVersion).
+    static std::uint64_t read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested = {},
+                              std::optional<std::uint32_t> hidDevice = std::nullopt);
 };
 
 }  // namespace VeltoTouch

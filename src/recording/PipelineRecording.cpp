@@ -5,6 +5,7 @@
 #include "platform/PropertyDictionary.h"
 #include "recording/ContainerFrames.h"
 #include "recording/ContainerWriter.h"
+#include "recording/HidRecorderReader.h"
 #include "recording/JsonValue.h"
 
 #include <algorithm>
@@ -46,9 +47,14 @@ PropertyValue migrateVersion0(const PropertyDictionary& container)
 
 PipelineRecording::PipelineRecording() : sleepMicroseconds(&MonotonicClock::sleepMicroseconds) {}
 
-PipelineRecording::PipelineRecording(std::optional<std::string_view> data) : PipelineRecording()
+PipelineRecording::PipelineRecording(std::optional<std::string_view> data, std::optional<std::uint32_t> hidDevice)
+    : PipelineRecording()
 {
     if (!data) reject("json not supplied");
+    if (HidRecorderReader::opens(*data)) {
+        HidRecorderReader::read(*data, [&](Frame&& frame) { _frames.push_back(std::move(frame)); }, hidDevice);
+        return;
+    }
     PropertyValue container;
     try {
         container = migrateSerializedContainer(JsonValue::parse(*data));

@@ -57,7 +57,12 @@ public:
     // "migrateSerializedContainer failed: "; errors in the frames as
     // std::invalid_argument. The result has no wrapped input, no limit and a
     // cursor that is not valid.
-    explicit PipelineRecording(std::optional<std::string_view> data);
+    //
+    // A text of hid-recorder is read as well (HidRecorderReader: the events
+    // of device `hidDevice`, or else of the surface's), its faults raised as
+    // HidRecorderReader::Fault, a std::invalid_argument.
+    explicit PipelineRecording(std::optional<std::string_view> data,
+                               std::optional<std::uint32_t> hidDevice = std::nullopt);
 
     // A copy shares the wrapped input and the state values, has its own frame
     // list and limit, and a playback cursor that is not valid.

@@ -22,7 +22,7 @@ TEST(Cli, UsageErrorsExitWithTwoAndOneLineThatNamesTheProblem)
     };
     const Case cases[] = {
         {{}, "A subcommand is required (see 'veltotouch help')"},
-        {{"frobnicate"}, "no command \"frobnicate\" (replay, synth, eval, dump, host, daemon, properties, ctl, report, emulate, help)"},
+        {{"frobnicate"}, "no command \"frobnicate\" (replay, synth, eval, dump, host, daemon, properties, ctl, report, emulate, convert, help)"},
         {{"replay"}, "FILE is required"},
         {{"synth", "tap top"}, "--output is required"},
         {{"replay", kTaps, "--speed", "nan"}, "--speed: expected a finite number, got nan (see 'veltotouch help replay')"},

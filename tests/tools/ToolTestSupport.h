@@ -22,15 +22,23 @@ using nlohmann::json;
 #ifdef VELTO_EXAMPLES_DIR
 inline const std::string kExamples = VELTO_EXAMPLES_DIR;
 
-// The names of the sample recordings (examples/NAME.json), in order.
+// The sample recordings by NAME, in order: containers (examples/NAME.json)
+// and hid-recorder captures (examples/NAME.hid).
 inline std::vector<std::string> exampleNames()
 {
     std::vector<std::string> names;
     for (const auto& entry : fs::directory_iterator(kExamples)) {
-        if (entry.path().extension() == ".json") names.push_back(entry.path().stem().string());
+        const auto extension = entry.path().extension();
+        if (extension == ".json" || extension == ".hid") names.push_back(entry.path().stem().string());
     }
     std::sort(names.begin(), names.end());
     return names;
+}
+
+inline std::string examplePath(const std::string& name)
+{
+    const std::string container = kExamples + "/" + name + ".json";
+    return fs::exists(container) ? container : kExamples + "/" + name + ".hid";
 }
 #endif
 

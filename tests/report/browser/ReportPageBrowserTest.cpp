@@ -61,7 +61,7 @@ protected:
     fs::path report(const std::string& example)
     {
         const fs::path page = dir.file(example + ".html");
-        const ToolRun run = runTool({"report", kExamples + "/" + example + ".json", "-o", page});
+        const ToolRun run = runTool({"report", examplePath(example), "-o", page});
         EXPECT_EQ(run.status, 0) << run.err;
         return page;
     }
@@ -79,7 +79,7 @@ using ReportPageScreenshotTest = ReportPageTest;
 TEST_P(ReportPageBrowserTest, PageShowsWhatReplaySees)
 {
     const std::string example = GetParam();
-    const std::string recording = kExamples + "/" + example + ".json";
+    const std::string recording = examplePath(example);
     const fs::path page = report(example);
     const std::string html = readFile(page);
     EXPECT_FALSE(std::regex_search(html, std::regex(R"((https?:|ftp:)//|\bsrc\s*=|\bhref\s*=|url\(|@import)",
