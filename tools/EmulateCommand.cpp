@@ -61,6 +61,13 @@ constexpr std::uint8_t kSurfaceUsage = 0x01;
 // delay is made up at once: reports are not sent in a burst.
 constexpr auto kCatchUpLimit = std::chrono::milliseconds(20);
 
+// How long a reader must keep the device open before reports go out. A
+// program that only looks at a new device opens it for a moment and closes
+// it again (the daemon does, for its ids, before it takes it): the reports
+// sent meanwhile would be lost with that look, and whoever then takes the
+// device for good would miss the start of the recording.
+constexpr auto kSteadyOpen = std::chrono::milliseconds(250);
+
 // One report: a run of bytes (8-bit fields, 0 to 255) whose usage is its ID.
 // `length` counts the ID, as the plug-in's lengths do.
 void appendReport(std::vector<std::uint8_t>& descriptor, std::uint8_t mainItem, std::uint8_t reportID,
@@ -144,9 +151,26 @@ void failIfBroken(const UhidDevice& device)
     if (!device.error().empty()) throw ToolError(device.error());
 }
 
+// Serves until a reader has had the device open for kSteadyOpen without a
+// break.
+void waitForSteadyReader(Playback& playback)
+{
+    UhidDevice& device = playback.device;
+    for (;;) {
+        if (!device.waitUntilOpened(playback.stopRequested)) {
+            failIfBroken(device);
+            throw PlaybackStopped{};
+        }
+        const std::uint64_t openings = device.openings();
+        if (!device.serveUntil(Clock::now() + kSteadyOpen, playback.stopRequested)) failIfBroken(device);
+        if (playback.stopRequested()) throw PlaybackStopped{};
+        if (device.isOpened() && device.openings() == openings) return;
+    }
+}
+
 // Made at the first input report, so that a recording that fails at its
-// start never makes a device appear and vanish; played once a reader has it
-// open, so that no report is lost while a daemon notices the new device.
+// start never makes a device appear and vanish; played once a reader keeps
+// it open, so that no report is lost while a daemon notices the new device.
 void createAndWaitForReader(Playback& playback)
 {
     const EmulateCommand::Options& options = playback.options;
@@ -155,10 +179,7 @@ void createAndWaitForReader(Playback& playback)
     if (!playback.device.create(identity)) failIfBroken(playback.device);
     playback.err << "veltotouch: " << kDeviceName << " " << hex4(options.vendor) << ":" << hex4(options.product)
                  << " made; playing " << options.file << " once a reader opens it (Ctrl-C to stop)" << std::endl;
-    if (!playback.device.waitUntilOpened(playback.stopRequested)) {
-        failIfBroken(playback.device);
-        throw PlaybackStopped{};
-    }
+    waitForSteadyReader(playback);
 }
 
 // Waits for the report's place in the schedule, answering requests meanwhile.
@@ -196,6 +217,8 @@ std::uint64_t playPass(Playback& playback, ToolFiles::File file)
             if (!playback.device.isCreated()) createAndWaitForReader(playback);
             waitForTurn(playback, frame.timestampNs);
             if (playback.stopRequested()) throw PlaybackStopped{};
+            // With no reader the report would be lost: the playback waits for one.
+            if (!playback.device.isOpened()) waitForSteadyReader(playback);
             if (!playback.device.sendInputReport(frame.report.data(), frame.report.size())) {
                 failIfBroken(playback.device);
             }

@@ -13,11 +13,11 @@ namespace VeltoTool {
 // `veltotouch emulate FILE`: a virtual surface. Makes a HID device through
 // the kernel's uhid driver that looks to its readers like the real surface
 // (its report descriptor declares the surface's input reports and the
-// feature reports the plug-in reads), waits until a reader opens it, plays
-// the recording's input reports into it with their recorded spacing and
-// answers the feature-report requests meanwhile. At the end of the recording
-// (with --loop: at SIGINT/SIGTERM) the device is removed, so that the reader
-// sees an unplug.
+// feature reports the plug-in reads), waits until a reader keeps it open,
+// plays the recording's input reports into it with their recorded spacing
+// (pausing while no reader has it open) and answers the feature-report
+// requests meanwhile. At the end of the recording (with --loop: at
+// SIGINT/SIGTERM) the device is removed, so that the reader sees an unplug.
 class EmulateCommand {
 public:
     static constexpr std::uint16_t kDefaultVendor = 0x1234;

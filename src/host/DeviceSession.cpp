@@ -16,6 +16,9 @@ constexpr const char* kFactoryName = "VeltoTouchHIDServiceFactory";
 constexpr const char* kPipelineDomain = "Pipeline.";
 // As-fast-as-possible playback still leaves the device's queue room.
 constexpr std::size_t kMaxQueuedReports = 512;
+// Events kept for the bus while the device's object is being made: more
+// than a few seconds of touches; the object takes milliseconds.
+constexpr std::size_t kMaxEventsBeforeBusObject = 256;
 
 }  // namespace
 
@@ -24,14 +27,19 @@ DeviceSession::DeviceSession(std::string name, HostDevice::Ref device, const std
     : _name(std::move(name)), _outputs(std::move(outputs)), _keyMap(_outputs.keys), _keyboard(_outputs.keyboard)
 {
     // Subscribed before the start, so that a real device's first reports are
-    // keyed too; they reach the bus once its object exists (a controller
-    // cannot have subscribed to an object that does not exist yet).
+    // keyed too. Their events reach the bus once its object exists: a
+    // listener to every device may well be there already (a surface that
+    // resets as it is plugged in sends its reset at once).
     _subscription = _host.subscribe([this](const HidEventRef& event) { onEvent(event); });
     _host.start(pluginPath, kFactoryName, std::move(device));
     _control = std::make_shared<HostDeviceControl>(_name, _host);
     if (!_outputs.bus) return;
     try {
-        _busId = _outputs.bus->addDevice(_control);
+        const BusService::DeviceId id = _outputs.bus->addDevice(_control);
+        std::lock_guard guard(_publishLock);
+        for (const HidEventRef& event : _beforeBusObject) _outputs.bus->publishEvent(id, event);
+        _beforeBusObject.clear();
+        _busId = id;
     } catch (...) {
         // Stopped while the members its deliveries use still exist.
         _host.stop();
@@ -103,8 +111,19 @@ std::uint64_t DeviceSession::play(const VeltoTouch::PipelineRecording& recording
 
 void DeviceSession::onEvent(const HidEventRef& event)
 {
-    if (const auto id = busId()) _outputs.bus->publishEvent(*id, event);
+    publish(event);
     sendKeys(_keyMap.handle(Gesture::of(*event)));
+}
+
+void DeviceSession::publish(const HidEventRef& event)
+{
+    if (!_outputs.bus) return;
+    std::lock_guard guard(_publishLock);
+    if (const auto id = busId()) {
+        _outputs.bus->publishEvent(*id, event);
+    } else if (_beforeBusObject.size() < kMaxEventsBeforeBusObject) {
+        _beforeBusObject.push_back(event);
+    }
 }
 
 void DeviceSession::sendKeys(const KeyMap::Actions& actions)

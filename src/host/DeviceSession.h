@@ -16,6 +16,7 @@
 #include <optional>
 #include <string>
 #include <thread>
+#include <vector>
 
 namespace VeltoHost {
 
@@ -81,6 +82,7 @@ public:
 
 private:
     void onEvent(const HidEventRef& event);
+    void publish(const HidEventRef& event);
     void sendKeys(const KeyMap::Actions& actions);
     void takeApart() noexcept;
 
@@ -91,6 +93,13 @@ private:
     static constexpr BusService::DeviceId kNoBusId = ~BusService::DeviceId{0};
     // Set once by the constructor while the host's queue may already deliver.
     std::atomic<BusService::DeviceId> _busId{kNoBusId};
+    // A listener that watches every device (ctl events, a match on the
+    // service's name) is there before a new device's object: the events of
+    // the device's first moments are kept until the object exists and then
+    // published after its DeviceAdded, in order. The lock orders publishing
+    // against that hand-over.
+    std::mutex _publishLock;
+    std::vector<HidEventRef> _beforeBusObject;  // guarded by _publishLock
     HostEventSystem::SubscriptionId _subscription = 0;
     // The host's event queue only, and the destructor once that is drained.
     KeyMap _keyMap;

@@ -170,7 +170,10 @@ bool UhidDevice::serveOne(Clock::duration timeout, bool& handled)
 void UhidDevice::handle(const uhid_event& event)
 {
     switch (event.type) {
-    case UHID_OPEN: _opened = true; break;
+    case UHID_OPEN:
+        _opened = true;
+        ++_openings;
+        break;
     case UHID_CLOSE: _opened = false; break;
     case UHID_GET_REPORT:
         answerFeatureRequest(event.u.get_report.id, event.u.get_report.rtype, event.u.get_report.rnum);

@@ -72,6 +72,9 @@ public:
     bool isCreated() const noexcept { return _created; }
     // A reader has the device open (the kernel's UHID_OPEN, until UHID_CLOSE).
     bool isOpened() const noexcept { return _opened; }
+    // How many times the kernel said it was opened: the same count on both
+    // sides of a wait that ends open means it stayed open all along.
+    std::uint64_t openings() const noexcept { return _openings; }
     const std::string& error() const noexcept { return _error; }
 
     // Removes the device (readers see it unplugged); the destructor does it
@@ -89,6 +92,7 @@ private:
     FeatureReportSource _featureReports;
     bool _created = false;
     bool _opened = false;
+    std::uint64_t _openings = 0;
     std::string _error;
 };
 

@@ -44,6 +44,12 @@ TEST(UhidDevice, WaitsForAReaderToOpenItAndNoticesTheKernelSideGoing)
     kernel->send(FakeUhidKernel::event(UHID_CLOSE));
     ASSERT_TRUE(device.servePending());
     EXPECT_FALSE(device.isOpened());
+    // Opened and closed again between two looks: the count tells.
+    kernel->send(FakeUhidKernel::event(UHID_OPEN));
+    kernel->send(FakeUhidKernel::event(UHID_CLOSE));
+    ASSERT_TRUE(device.servePending());
+    EXPECT_FALSE(device.isOpened());
+    EXPECT_EQ(device.openings(), 2u);
 
     kernel.reset();
     EXPECT_FALSE(device.waitUntilOpened([] { return false; }));

@@ -223,6 +223,37 @@ TEST(EmulateCommand, LoopsUntilStoppedAndPlaysNothingBeforeAReaderOpensIt)
     EXPECT_EQ(unopened.finish(), 0);
 }
 
+TEST(EmulateCommand, PlaysNothingIntoAReaderThatOnlyLooksAtTheDevice)
+{
+    TempDir dir;
+    EmulateCommand::Options options;
+    options.file = dir.file("look.json", recordingOf({image(1), image(2)}));
+    options.speed = 0;
+    // Opened and closed again at once, as the daemon reads a new device's ids
+    // before it takes it: the reports would be lost with that look.
+    Background looked(options);
+    EXPECT_EQ(looked.nextType(), UHID_CREATE2);
+    looked.kernel.send(FakeUhidKernel::event(UHID_OPEN));
+    looked.kernel.send(FakeUhidKernel::event(UHID_CLOSE));
+    looked.kernel.send(FakeUhidKernel::getReport(1, 0x1F));
+    EXPECT_EQ(looked.nextType(), UHID_GET_REPORT_REPLY);
+    looked.stop = true;
+    EXPECT_EQ(looked.nextType(), UHID_DESTROY) << "no report played";
+    EXPECT_EQ(looked.finish(), 0) << looked.err.str();
+
+    // The reader that comes after the look gets the recording from its start.
+    Background taken(options);
+    EXPECT_EQ(taken.nextType(), UHID_CREATE2);
+    for (std::uint32_t type : {UHID_OPEN, UHID_CLOSE, UHID_OPEN}) taken.kernel.send(FakeUhidKernel::event(type));
+    for (std::uint8_t fill : {1, 2}) {
+        const auto event = taken.kernel.receive();
+        ASSERT_TRUE(event && event->type == UHID_INPUT2);
+        EXPECT_EQ(bytes(event->u.input2.data, event->u.input2.size), image(fill));
+    }
+    EXPECT_EQ(taken.nextType(), UHID_DESTROY);
+    EXPECT_EQ(taken.finish(), 0) << taken.err.str();
+}
+
 // A recording that fails at its start never makes a device appear.
 TEST(EmulateCommand, ARecordingThatCannotBePlayedIsNamedAndMakesNoDevice)
 {
