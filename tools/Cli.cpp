@@ -417,7 +417,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             host.settings = splitAll(hostSets);
             return HostCommand::run(host, out, err);
         } else if (*daemonCommand) {
-            return DaemonCommand::run(daemon);
+            return DaemonCommand::run(daemon, err);
         } else if (*ctlCommand) {
             return CtlCommand::run(ctl, out, err);
         } else if (*emulateCommand) {

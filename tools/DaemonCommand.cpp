@@ -36,7 +36,7 @@ std::string nothingToServe(const DaemonCommand::Options& options)
 
 }  // namespace
 
-int DaemonCommand::run(const Options& options)
+int DaemonCommand::run(const Options& options, std::ostream& err)
 {
     const StopSignals signals(StopSignals::Hangup::Reload);
     // A large request (a client may send megabytes that are then refused) is
@@ -70,7 +70,9 @@ int DaemonCommand::run(const Options& options)
     switch (service.run(&StopSignals::requested, &StopSignals::takeReloadRequest)) {
     case Daemon::Ending::Stopped: return 0;
     case Daemon::Ending::BusLost: throw ToolError("the connection to " + busDescription + " was lost");
-    case Daemon::Ending::NothingToServe: throw ToolError(nothingToServe(options));
+    case Daemon::Ending::NothingToServe:
+        err << "veltotouch: " << nothingToServe(options) << '\n';
+        return kNothingToServe;
     }
     return 0;
 }

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -21,10 +22,16 @@ public:
         std::string plugin;  // empty: look for it (PluginLocator)
     };
 
-    // Returns the exit status (0 when stopped by a signal); throws ToolError
-    // (or the readers' errors) for what keeps the service from starting or
-    // running: no bus, the bus lost, nothing to serve.
-    static int run(const Options& options);
+    // The exit status when the command line and the configuration leave
+    // nothing to serve: sysexits' EX_CONFIG, which the unit names in
+    // RestartPreventExitStatus=, since restarting cannot help until an
+    // administrator adds a [[match]].
+    static constexpr int kNothingToServe = 78;
+
+    // Returns the exit status (0 when stopped by a signal; kNothingToServe,
+    // with its reason on err); throws ToolError (or the readers' errors) for
+    // what keeps the service from starting or running: no bus, the bus lost.
+    static int run(const Options& options, std::ostream& err);
 };
 
 }  // namespace VeltoTool

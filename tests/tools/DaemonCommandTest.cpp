@@ -1,6 +1,7 @@
 // The daemon and its client as an integrator runs them: the built tool as a
 // process of its own on a private bus, asked by `veltotouch ctl`, by busctl
 // and by a plain D-Bus client.
+#include "DaemonCommand.h"
 #include "PrivateBus.h"
 #include "ToolProcessSupport.h"
 #include "ToolTestSupport.h"
@@ -341,7 +342,7 @@ TEST(DaemonCommandTest, BadDevicesAreNamedAndLeftOutAndWithNothingToServeTheDaem
     for (const auto& end : ends) {
         ToolProcess ending(end.arguments);
         const ToolProcess::Result ended = ending.finish(kDeadline);
-        EXPECT_EQ(ended.status, 1) << ended.err;
+        EXPECT_EQ(ended.status, VeltoTool::DaemonCommand::kNothingToServe) << ended.err;
         EXPECT_TRUE(ended.err.ends_with(end.lastLine)) << ended.err;
     }
 }

@@ -55,8 +55,11 @@ TEST(InstallTest, TheServiceFilesLandWhereTheUnitLooksAndTheConfigurationIsKept)
     const fs::path program = root.path() / fs::path(exec[1].str()).relative_path();
     const fs::path config = root.path() / fs::path(exec[2].str()).relative_path();
     EXPECT_TRUE(fs::exists(config)) << config;
-    for (const char* file : {"lib/veltotouch/libVeltoTouchHIDService.so", "lib/udev/rules.d/70-veltotouch.rules", "lib/sysusers.d/veltotouch.conf",
-                             "share/dbus-1/system.d/org.veltotouch.VeltoTouch1.conf"}) {
+    const std::string privateLibraries = std::string(VELTO_INSTALL_LIBDIR) + "/veltotouch/";
+    for (const std::string& file :
+         {privateLibraries + "libVeltoTouchHIDService.so", privateLibraries + "libveltotouch_platform.so",
+          std::string("lib/udev/rules.d/70-veltotouch.rules"), std::string("lib/sysusers.d/veltotouch.conf"),
+          std::string("share/dbus-1/system.d/org.veltotouch.VeltoTouch1.conf")}) {
         EXPECT_TRUE(fs::exists(prefix / file)) << file;
     }
 
