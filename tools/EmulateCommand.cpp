@@ -2,11 +2,11 @@
 
 #include "ToolError.h"
 #include "ToolFiles.h"
+#include "VirtualSurface.h"
 #include "host/GapCap.h"
 #include "host/StopSignals.h"
 #include "platform/UhidDevice.h"
 #include "records/FeatureReport.h"
-#include "records/InputReport.h"
 #include "records/LittleEndian.h"
 #include "recording/PipelineRecording.h"
 #include "service/VeltoTouchHIDService.h"
@@ -33,30 +33,6 @@ using Clock = std::chrono::steady_clock;
 using Service = VeltoTouch::VeltoTouchHIDService;
 using HoldDuration = VeltoTouch::FeatureReport::FactoryResetHoldDuration;
 
-constexpr const char* kDeviceName = "VeltoTouch virtual surface";
-
-// Report descriptor short items: tag and type, with the number of data bytes
-// that follow in the low two bits.
-constexpr std::uint8_t kUsagePage16 = 0x06;
-constexpr std::uint8_t kUsage8 = 0x09;
-constexpr std::uint8_t kCollection8 = 0xA1;
-constexpr std::uint8_t kEndCollection = 0xC0;
-constexpr std::uint8_t kLogicalMinimum8 = 0x15;
-constexpr std::uint8_t kLogicalMaximum16 = 0x26;
-constexpr std::uint8_t kReportSize8 = 0x75;
-constexpr std::uint8_t kReportID8 = 0x85;
-constexpr std::uint8_t kReportCount16 = 0x96;
-constexpr std::uint8_t kInput8 = 0x81;
-constexpr std::uint8_t kFeature8 = 0xB1;
-constexpr std::uint8_t kApplicationCollection = 0x01;
-constexpr std::uint8_t kDataVariableAbsolute = 0x02;
-
-// The surface sits in one application collection on the vendor-defined usage
-// page 0xFF00, usage 0x01: no input driver of the kernel takes such a device,
-// so its reports reach readers through hidraw alone, as the real surface's do.
-constexpr std::uint16_t kVendorUsagePage = 0xFF00;
-constexpr std::uint8_t kSurfaceUsage = 0x01;
-
 // When a schedule has fallen behind (a slow kernel), at most this much of the
 // delay is made up at once: reports are not sent in a burst.
 constexpr auto kCatchUpLimit = std::chrono::milliseconds(20);
@@ -67,45 +43,6 @@ constexpr auto kCatchUpLimit = std::chrono::milliseconds(20);
 // sent meanwhile would be lost with that look, and whoever then takes the
 // device for good would miss the start of the recording.
 constexpr auto kSteadyOpen = std::chrono::milliseconds(250);
-
-// One report: a run of bytes (8-bit fields, 0 to 255) whose usage is its ID.
-// `length` counts the ID, as the plug-in's lengths do.
-void appendReport(std::vector<std::uint8_t>& descriptor, std::uint8_t mainItem, std::uint8_t reportID,
-                  std::size_t length)
-{
-    const auto count = static_cast<std::uint16_t>(length - 1);
-    descriptor.insert(descriptor.end(), {kReportID8, reportID, kUsage8, reportID, kReportCount16,
-                                         static_cast<std::uint8_t>(count), static_cast<std::uint8_t>(count >> 8),
-                                         mainItem, kDataVariableAbsolute});
-}
-
-// The kernel drops input reports whose ID the descriptor does not declare,
-// and pads shorter ones: both input reports are declared at the length the
-// plug-in parses. The feature reports are declared at the length the plug-in
-// reads them with (its buffer for the debug reports, the parsed layout for
-// the hold duration), so that hidraw readers see what the device would send.
-std::vector<std::uint8_t> surfaceDescriptor()
-{
-    constexpr auto kPageLow = static_cast<std::uint8_t>(kVendorUsagePage);
-    constexpr auto kPageHigh = static_cast<std::uint8_t>(kVendorUsagePage >> 8);
-    std::vector<std::uint8_t> descriptor = {
-        kUsagePage16,      kPageLow, kPageHigh,
-        kUsage8,           kSurfaceUsage,
-        kCollection8,      kApplicationCollection,
-        kLogicalMinimum8,  0x00,
-        kLogicalMaximum16, 0xFF, 0x00,
-        kReportSize8,      8,
-    };
-    using namespace VeltoTouch::InputReport;
-    appendReport(descriptor, kInput8, Image::kReportID, Image::kLength);
-    appendReport(descriptor, kInput8, FirmwareEvent::kReportID, FirmwareEvent::kLength);
-    appendReport(descriptor, kFeature8, HoldDuration::kReportID, HoldDuration::kLength);
-    for (std::uint8_t reportID : Service::kFirmwareDebugReportIDs) {
-        appendReport(descriptor, kFeature8, reportID, Service::kFirmwareDebugReportBufferSize);
-    }
-    descriptor.push_back(kEndCollection);
-    return descriptor;
-}
 
 // The hold duration as the plug-in parses it; each debug report is its ID
 // over its whole length, recognisable in the plug-in's hex text (a shift or
@@ -174,10 +111,10 @@ void waitForSteadyReader(Playback& playback)
 void createAndWaitForReader(Playback& playback)
 {
     const EmulateCommand::Options& options = playback.options;
-    const UhidDevice::Identity identity{kDeviceName, BUS_USB, options.vendor, options.product, 0, 0,
-                                        surfaceDescriptor()};
+    const UhidDevice::Identity identity{VirtualSurface::kName, BUS_USB, options.vendor, options.product, 0, 0,
+                                        VirtualSurface::reportDescriptor()};
     if (!playback.device.create(identity)) failIfBroken(playback.device);
-    playback.err << "veltotouch: " << kDeviceName << " " << hex4(options.vendor) << ":" << hex4(options.product)
+    playback.err << "veltotouch: " << VirtualSurface::kName << " " << hex4(options.vendor) << ":" << hex4(options.product)
                  << " made; playing " << options.file << " once a reader opens it (Ctrl-C to stop)" << std::endl;
     waitForSteadyReader(playback);
 }
