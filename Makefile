@@ -8,7 +8,7 @@ ifeq ($(CI),true)
 CMAKE_FLAGS += -DVELTO_WERROR=ON
 endif
 
-.PHONY: deps configure build test demo bench clean
+.PHONY: deps configure build test demo bench bench-key-latency package demo-system clean
 
 deps:
 	@scripts/install-deps
@@ -26,9 +26,30 @@ demo: build
 	@if [ -x $(BUILD_DIR)/tools/veltotouch ]; then scripts/demo $(BUILD_DIR); \
 	else echo "make demo: the veltotouch tool is not built yet (see README)"; fi
 
+# The Release build installs where a system service's files are looked for:
+# the package, the benchmarks and a `sudo cmake --install build-release` share it.
+RELEASE = $(MAKE) --no-print-directory build BUILD_DIR=build-release BUILD_TYPE=Release \
+	CMAKE_FLAGS="$(CMAKE_FLAGS) -DCMAKE_INSTALL_PREFIX=/usr"
+
 bench:
-	@$(MAKE) --no-print-directory build BUILD_DIR=build-release BUILD_TYPE=Release
+	@$(RELEASE)
 	@for b in build-release/bench/bench_*; do [ -x "$$b" ] && "$$b" --benchmark_repetitions=5 --benchmark_report_aggregates_only=true; done
+
+# From a report written into a virtual surface to its key on evdev, through
+# the daemon, in the VM (bench/bench_key_latency.cpp says what is timed).
+bench-key-latency:
+	@$(RELEASE)
+	@scripts/bench-key-latency --build build-release
+
+# The Debian package, build-release/veltotouch_VERSION_amd64.deb.
+package:
+	@$(RELEASE)
+	@cd build-release && cpack -G DEB
+
+# The package installed in a VM with systemd, an emulated surface playing the
+# demo recording, and each gesture beside the key that libinput saw.
+demo-system: package
+	@scripts/demo-system build-release/veltotouch_*_amd64.deb
 
 clean:
 	rm -rf build build-release build-asan build-tsan build-fuzz
