@@ -41,9 +41,12 @@ void appendReport(std::vector<std::uint8_t>& descriptor, std::uint8_t mainItem, 
                   std::size_t length)
 {
     const auto count = static_cast<std::uint16_t>(length - 1);
-    descriptor.insert(descriptor.end(), {kReportID8, reportID, kUsage8, reportID, kReportCount16,
-                                         static_cast<std::uint8_t>(count), static_cast<std::uint8_t>(count >> 8),
-                                         mainItem, kDataVariableAbsolute});
+    // Byte by byte: GCC 12's link-time optimiser warns, wrongly, that an
+    // insert of an initializer list here reads past its source.
+    for (std::uint8_t byte : {kReportID8, reportID, kUsage8, reportID, kReportCount16, static_cast<std::uint8_t>(count),
+                              static_cast<std::uint8_t>(count >> 8), mainItem, kDataVariableAbsolute}) {
+        descriptor.push_back(byte);
+    }
 }
 
 }  // namespace

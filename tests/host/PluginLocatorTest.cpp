@@ -17,7 +17,7 @@ TEST(PluginLocatorTest, LooksInTheEnvironmentThenBesideTheProgramThenTheBuildThe
     fs::create_directories(installedTree / "bin");
     fs::create_directories(root / "build");
     const std::string program = (installedTree / "bin" / "veltotouch").string();
-    const fs::path module = fs::path("lib") / "veltotouch" / "libVeltoTouchHIDService.so";
+    const fs::path module = fs::path(VELTO_INSTALL_LIBDIR) / "veltotouch" / "libVeltoTouchHIDService.so";
     const std::string besideProgram = (installedTree / module).string();
     const std::string buildTree = (root / "build" / "module.so").string();
     const std::string installed = (root / "usr" / module).string();
