@@ -13,6 +13,8 @@ namespace VeltoTouch {
 
 using VeltoHost::PropertyDictionary;
 
+using Util::hexDigit;
+
 namespace {
 
 constexpr std::string_view kTypeKey = "Type";
@@ -26,18 +28,7 @@ constexpr std::string_view kReportDataKey = "ReportData";
 
 [[noreturn]] void reject(const char* message) { throw std::invalid_argument(message); }
 
-// The value of each hex digit character, -1 for every other byte: one
-// lookup per character instead of three range tests.
-constexpr std::array<std::int8_t, 256> kHexDigits = [] {
-    std::array<std::int8_t, 256> digits{};
-    digits.fill(-1);
-    for (int c = '0'; c <= '9'; ++c) digits[c] = static_cast<std::int8_t>(c - '0');
-    for (int c = 'a'; c <= 'f'; ++c) digits[c] = static_cast<std::int8_t>(c - 'a' + 10);
-    for (int c = 'A'; c <= 'F'; ++c) digits[c] = static_cast<std::int8_t>(c - 'A' + 10);
-    return digits;
-}();
 
-int hexDigit(char c) { return kHexDigits[static_cast<unsigned char>(c)]; }
 
 // Report text as the writer produces it (two hex digits and a blank per byte)
 // is decoded directly; anything else goes to the general hex reader, which

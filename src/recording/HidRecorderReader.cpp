@@ -1,5 +1,6 @@
 #include "recording/HidRecorderReader.h"
 
+#include "records/HexText.h"
 #include "records/InputReport.h"
 #include "recording/ReportDescriptor.h"
 
@@ -16,15 +17,6 @@ constexpr std::uint64_t kNanosecondsPerMicrosecond = 1'000;
 constexpr std::size_t kMicrosecondDigits = 6;
 constexpr std::string_view kByteOrderMark = "\xEF\xBB\xBF";
 
-// The value of each hex digit character, -1 for every other byte.
-constexpr std::array<std::int8_t, 256> kHexDigits = [] {
-    std::array<std::int8_t, 256> digits{};
-    digits.fill(-1);
-    for (int c = '0'; c <= '9'; ++c) digits[c] = static_cast<std::int8_t>(c - '0');
-    for (int c = 'a'; c <= 'f'; ++c) digits[c] = static_cast<std::int8_t>(c - 'a' + 10);
-    for (int c = 'A'; c <= 'F'; ++c) digits[c] = static_cast<std::int8_t>(c - 'A' + 10);
-    return digits;
-}();
 
 bool isBlank(char c) { return c == ' ' || c == '\t'; }
 bool isDigit(char c) { return c >= '0' && c <= '9'; }
@@ -67,7 +59,7 @@ std::optional<std::uint32_t> hex(std::string_view word)
     if (word.empty() || word.size() > 8) return std::nullopt;
     std::uint32_t value = 0;
     for (char c : word) {
-        const int digit = kHexDigits[static_cast<unsigned char>(c)];
+        const int digit = Util::hexDigit(c);
         if (digit < 0) return std::nullopt;
         value = value << 4 | static_cast<std::uint32_t>(digit);
     }
@@ -84,8 +76,8 @@ bool hexBytes(std::string_view text, std::vector<std::uint8_t>& bytes)
         while (at < end && isBlank(*at)) ++at;
         if (at == end) return true;
         if (end - at < 2 || (end - at > 2 && !isBlank(at[2]))) return false;
-        const int high = kHexDigits[static_cast<unsigned char>(at[0])];
-        const int low = kHexDigits[static_cast<unsigned char>(at[1])];
+        const int high = Util::hexDigit(at[0]);
+        const int low = Util::hexDigit(at[1]);
         if ((high | low) < 0) return false;
         bytes.push_back(static_cast<std::uint8_t>(high << 4 | low));
         at += 2;
