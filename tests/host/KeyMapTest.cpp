@@ -20,7 +20,9 @@ std::string describe(const KeyMap::Actions& actions)
 {
     std::string text;
     for (const KeyMap::Action& action : actions) {
-        text += (action.pressed ? "+" : "-") + KeyMap::keyName(action.code) + " ";
+        text += action.pressed ? '+' : '-';
+        text += KeyMap::keyName(action.code);
+        text += ' ';
     }
     return text.empty() ? "(nothing)" : text;
 }
