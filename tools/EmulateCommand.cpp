@@ -115,7 +115,7 @@ void createAndWaitForReader(Playback& playback)
                                         VirtualSurface::reportDescriptor()};
     if (!playback.device.create(identity)) failIfBroken(playback.device);
     playback.err << "veltotouch: " << VirtualSurface::kName << " " << hex4(options.vendor) << ":" << hex4(options.product)
-                 << " made; playing " << options.file << " once a reader opens it (Ctrl-C to stop)" << std::endl;
+                 << " made; playing " << options.file << " once a reader keeps it open (Ctrl-C to stop)" << std::endl;
     waitForSteadyReader(playback);
 }
 

@@ -213,7 +213,7 @@ TEST(EmulateCommand, LoopsUntilStoppedAndPlaysNothingBeforeAReaderOpensIt)
     EXPECT_EQ(type, UHID_DESTROY);
     EXPECT_EQ(background.finish(), 0) << background.err.str();
     EXPECT_EQ(background.err.str(), "veltotouch: VeltoTouch virtual surface 1234:5678 made; playing " + options.file +
-                                        " once a reader opens it (Ctrl-C to stop)\n");
+                                        " once a reader keeps it open (Ctrl-C to stop)\n");
 
     // Stopped while nobody has it open: made and removed, nothing played.
     Background unopened(options);
