@@ -221,8 +221,10 @@ void HidRecorderReader::readLine(std::string_view line)
     if (line.size() > kLongestLine) fail("longer than " + std::to_string(kLongestLine) + " bytes");
     // A byte order mark is no part of the first line.
     if (_line == 1 && line.starts_with(kByteOrderMark)) line.remove_prefix(kByteOrderMark.size());
+    // A carriage return is blank space at either end of a line, as the
+    // streaming reader takes one before the first line.
     while (!line.empty() && (isBlank(line.back()) || line.back() == '\r')) line.remove_suffix(1);
-    skipBlanks(line);
+    while (!line.empty() && (isBlank(line.front()) || line.front() == '\r')) line.remove_prefix(1);
     if (line.empty() || line.front() == '#') return;
     if (line.size() < 2 || line[1] != ':') fail("unknown line (expected D:, R:, N:, P:, I:, E: or a # comment)");
     std::string_view fields = line.substr(2);

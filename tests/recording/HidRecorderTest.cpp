@@ -139,6 +139,7 @@ TEST(HidRecorderReader, AFaultNamesItsLineAndEveryReaderRaisesTheSame)
         {"R: 1 0x1", 0, 1, "invalid hex byte in the report descriptor"},
         {"D: 1\nR: 1 01\nD: 2\nD: 1\nR: 1 01", 0, 5, "a second report descriptor for device 1"},
         {"D: x", 0, 1, "invalid device number"},
+        {"\xEF\xBB\xBF\r \rD:  c\r\n", 0, 1, "invalid device number"},
         {"D: 1 2", 0, 1, "invalid device number"},
         {"D: 4294967296", 0, 1, "invalid device number"},
         {"I: 3 1234", 0, 1, "invalid ids (expected I: BUS VENDOR PRODUCT in hex)"},
