@@ -24,6 +24,7 @@
 #include "records/InputReport.h"
 #include "pipeline/Pipeline.h"
 #include "records/DomainKey.h"
+#include "records/Gesture.h"
 #include "platform/HidEvent.h"
 #include "platform/PropertyDictionary.h"
 #include "recording/JsonValue.h"
@@ -361,14 +362,17 @@ private:
     {
         VELTO_FUZZ_CHECK(event.kind() == HidEvent::Kind::Digitizer);
         VELTO_FUZZ_CHECK(event.integerValue(VeltoTouch::Algs::kFrameNumberField) == std::int64_t{frameNumber});
-        // One of the six gesture moments; only a cancel has no region.
-        const std::uint16_t phase = event.phase();
-        VELTO_FUZZ_CHECK(phase == 0 || phase == HidEvent::kPhaseMayBegin || phase == HidEvent::kPhaseBegan ||
-                         phase == HidEvent::kPhaseChanged || phase == HidEvent::kPhaseEnded ||
-                         phase == HidEvent::kPhaseCancelled);
-        const double region = event.digitizer().y;
-        VELTO_FUZZ_CHECK(region == 0 || region == 1 || region == 2 || region == 3);
-        if (phase == HidEvent::kPhaseCancelled) VELTO_FUZZ_CHECK(region == 0);
+        // One of the six gesture moments, its fields exactly as the gesture
+        // encodes them; only a cancel has no region.
+        const VeltoTouch::Gesture gesture = VeltoTouch::Gesture::of(event);
+        const VeltoHost::HidEventRef encoded = gesture.event();
+        VELTO_FUZZ_CHECK(encoded != nullptr);
+        VELTO_FUZZ_CHECK(event.phase() == encoded->phase());
+        VELTO_FUZZ_CHECK(event.digitizer().eventMask == encoded->digitizer().eventMask);
+        VELTO_FUZZ_CHECK(event.digitizer().y == encoded->digitizer().y);
+        if (gesture.kind == VeltoTouch::Gesture::Kind::Cancel) {
+            VELTO_FUZZ_CHECK(gesture.region == VeltoTouch::Gesture::Region::None);
+        }
     }
 
     void checkCountersGrew(const Counters& now) const

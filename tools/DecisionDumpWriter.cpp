@@ -2,7 +2,6 @@
 
 #include "algs/DecisionDump.h"
 #include "algs/VirtualImage.h"
-#include "host/Gesture.h"
 #include "host/GestureFields.h"
 #include "platform/PropertyDictionary.h"
 #include "recording/JsonValue.h"
@@ -14,6 +13,7 @@
 namespace VeltoTool {
 
 using VeltoTouch::DecisionRecord;
+using VeltoTouch::Gesture;
 using Json = nlohmann::ordered_json;
 
 namespace {
@@ -34,11 +34,6 @@ const char* phaseName(VeltoTouch::TouchPhase phase)
     case TouchPhase::EndTouch: return "end-touch";
     }
     return "unknown";
-}
-
-std::string_view regionName(VeltoTouch::PixelRegion region)
-{
-    return VeltoHost::Gesture::name(static_cast<VeltoHost::Gesture::Region>(region));
 }
 
 // The entries of `after` that differ from `before`, descending into
@@ -100,10 +95,10 @@ Json DecisionDumpWriter::toJson(const DecisionRecord& record)
     line["activeVirtualPixels"] = std::move(activeGroups);
     line["svmScore"] = shortest(record.svmScore);
     line["touchScore"] = shortest(record.touchScore);
-    line["region"] = regionName(record.activeRegion);
+    line["region"] = Gesture::name(record.activeRegion);
     Json scores = Json::object();
     for (std::size_t region = 0; region < record.regionScores.size(); ++region) {
-        scores[std::string(regionName(static_cast<VeltoTouch::PixelRegion>(region)))] = shortest(record.regionScores[region]);
+        scores[std::string(Gesture::name(static_cast<Gesture::Region>(region)))] = shortest(record.regionScores[region]);
     }
     line["regionScores"] = std::move(scores);
     line["tap"] = {{"signalPerDuration", shortest(record.signalPerDuration)},

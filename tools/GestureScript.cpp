@@ -4,6 +4,7 @@
 
 #include <charconv>
 #include <cmath>
+#include <optional>
 #include <sstream>
 
 namespace VeltoTool {
@@ -19,12 +20,12 @@ constexpr std::uint32_t kDefaultTapMs = 120;
     throw ToolError("script line " + std::to_string(line) + ": " + message);
 }
 
+// A touch is always somewhere: "none" names no place to touch.
 PixelRegion parseRegion(const std::string& word, int line)
 {
-    if (word == "top") return PixelRegion::Top;
-    if (word == "middle") return PixelRegion::Middle;
-    if (word == "bottom") return PixelRegion::Bottom;
-    fail(line, "unknown region \"" + word + "\" (top, middle or bottom)");
+    const std::optional<PixelRegion> region = VeltoTouch::Gesture::regionFromName(word);
+    if (!region || *region == PixelRegion::None) fail(line, "unknown region \"" + word + "\" (top, middle or bottom)");
+    return *region;
 }
 
 std::vector<std::string> words(const std::string& statement)

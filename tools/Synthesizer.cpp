@@ -79,10 +79,8 @@ void Synthesizer::tellTruth(TruthRecord::Kind kind, const GestureScript::Step& s
     if (!_truth) return;
     TruthRecord record;
     record.kind = kind;
-    // The recogniser's regions and the gesture regions are numbered alike.
-    const auto region = [](VeltoTouch::PixelRegion r) { return static_cast<TruthRecord::Region>(static_cast<int>(r)); };
-    record.region = region(step.from);
-    record.to = region(step.to);
+    record.region = step.from;
+    record.to = step.to;
     if (kind != TruthRecord::Kind::Tap && kind != TruthRecord::Kind::Hold && kind != TruthRecord::Kind::Slide) {
         record.region = record.to = TruthRecord::Region::None;
     }

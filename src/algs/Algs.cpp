@@ -17,11 +17,6 @@ using VeltoHost::LogLevel;
 
 namespace {
 
-constexpr std::uint32_t kTransducerFinger = 2;
-constexpr std::uint32_t kEventMaskNone = 0;
-constexpr std::uint32_t kEventMaskHold = 0x00000002;
-constexpr std::uint32_t kEventMaskTap = 0x00020000;
-
 // Gain of each pad A..O, evening out the pads' different sizes and distances
 // from the cover.
 constexpr std::array<float, InputReport::kPadCount> kPadGains = {
@@ -29,19 +24,6 @@ constexpr std::array<float, InputReport::kPadCount> kPadGains = {
     1.4851f, 1.5033f, 2.4154f, 1.5378f, 1.5431f, 1.04f,   1.0493f};
 
 constexpr const char* kFactorDomain = "VirtualNormalizationFactors";
-
-HidEventRef createGestureEvent(std::uint32_t eventMask, PixelRegion region)
-{
-    return HidEvent::createDigitizerEvent(0, kTransducerFinger, 0, 0, eventMask, 0, 0.0,
-                                          static_cast<double>(static_cast<std::uint32_t>(region)), 0.0, 0.0, 0.0,
-                                          false, false, 0);
-}
-
-HidEventRef withPhase(HidEventRef event, std::uint16_t phase)
-{
-    event->setPhase(phase);
-    return event;
-}
 
 // Index after the factor domain and its dot, read as a stream reads an
 // unsigned number: blanks skipped, digits up to the first other character,
@@ -316,31 +298,19 @@ DecisionRecord Algs::decisionRecord(const Readings& readings, unsigned int frame
     return record;
 }
 
-HidEventRef Algs::createMayBeginEvent(PixelRegion region)
-{
-    return withPhase(createGestureEvent(kEventMaskNone, region), HidEvent::kPhaseMayBegin);
-}
+HidEventRef Algs::createMayBeginEvent(PixelRegion region) { return Gesture{Gesture::Kind::MayBegin, region}.event(); }
 
-HidEventRef Algs::createHoldStartEvent(PixelRegion region)
-{
-    return withPhase(createGestureEvent(kEventMaskHold, region), HidEvent::kPhaseBegan);
-}
+HidEventRef Algs::createHoldStartEvent(PixelRegion region) { return Gesture{Gesture::Kind::HoldStart, region}.event(); }
 
 HidEventRef Algs::createHoldChangeEvent(PixelRegion region)
 {
-    return withPhase(createGestureEvent(kEventMaskHold, region), HidEvent::kPhaseChanged);
+    return Gesture{Gesture::Kind::HoldChange, region}.event();
 }
 
-HidEventRef Algs::createHoldEndEvent(PixelRegion region)
-{
-    return withPhase(createGestureEvent(kEventMaskHold, region), HidEvent::kPhaseEnded);
-}
+HidEventRef Algs::createHoldEndEvent(PixelRegion region) { return Gesture{Gesture::Kind::HoldEnd, region}.event(); }
 
-HidEventRef Algs::createTapEvent(PixelRegion region) { return createGestureEvent(kEventMaskTap, region); }
+HidEventRef Algs::createTapEvent(PixelRegion region) { return Gesture{Gesture::Kind::Tap, region}.event(); }
 
-HidEventRef Algs::createCancelEvent()
-{
-    return withPhase(createGestureEvent(kEventMaskNone, PixelRegion::None), HidEvent::kPhaseCancelled);
-}
+HidEventRef Algs::createCancelEvent() { return Gesture{Gesture::Kind::Cancel, PixelRegion::None}.event(); }
 
 }  // namespace VeltoTouch

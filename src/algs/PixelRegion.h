@@ -1,15 +1,10 @@
 #pragma once
 
-#include <cstdint>
+#include "records/Gesture.h"
 
 namespace VeltoTouch {
 
-// Regions of the surface; the value travels in a gesture event's y.
-enum class PixelRegion : std::uint32_t {
-    None = 0,
-    Middle = 1,
-    Bottom = 2,
-    Top = 3,
-};
+// The recogniser's name for the regions of the surface: the gesture regions.
+using PixelRegion = Gesture::Region;
 
 }  // namespace VeltoTouch

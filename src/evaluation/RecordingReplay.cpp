@@ -7,7 +7,7 @@ RecordingReplay::RecordingReplay(const PipelineSettings& settings)
     for (const PipelineSetting& setting : settings) _pipeline.setState(setting.key, setting.propertyValue());
     _pipeline.hidEventsProbe = [this](const VeltoHost::HidEventList& events) {
         for (const auto& event : events) {
-            _outcome.gestures.push_back({VeltoHost::Gesture::of(*event), event->timeStamp()});
+            _outcome.gestures.push_back({Gesture::of(*event), event->timeStamp()});
         }
     };
 }

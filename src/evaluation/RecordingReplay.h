@@ -1,7 +1,7 @@
 #pragma once
 
 #include "evaluation/PipelineSetting.h"
-#include "host/Gesture.h"
+#include "records/Gesture.h"
 #include "pipeline/Pipeline.h"
 #include "recording/PipelineRecording.h"
 
@@ -21,7 +21,7 @@ namespace VeltoTouch {
 class RecordingReplay {
 public:
     struct TimedGesture {
-        VeltoHost::Gesture gesture;
+        Gesture gesture;
         std::uint64_t timestamp = 0;  // ticks
     };
 

@@ -8,7 +8,6 @@
 namespace VeltoTouch {
 
 using Kind = TruthRecord::Kind;
-using VeltoHost::Gesture;
 
 namespace {
 
@@ -56,7 +55,7 @@ std::vector<Recognised> gesturesOf(const std::vector<RecordingReplay::TimedGestu
         }
     }
     closeHold();
-    // A hold is placed at its start, so the list is no longer in time order.
+    // A hold is placed at its start, so the list is out of time order.
     std::stable_sort(out.begin(), out.end(),
                      [](const Recognised& a, const Recognised& b) { return a.gesture.start < b.gesture.start; });
     return out;

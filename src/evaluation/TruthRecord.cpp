@@ -8,8 +8,6 @@
 
 namespace VeltoTouch {
 
-using Gesture = VeltoHost::Gesture;
-
 namespace {
 
 constexpr TruthRecord::Kind kKinds[] = {TruthRecord::Kind::Tap,  TruthRecord::Kind::Hold,  TruthRecord::Kind::Slide,
@@ -26,7 +24,7 @@ TruthRecord::Region readRegion(const nlohmann::json& object, const char* key, in
     if (found == object.end() || !found->is_string()) fail(line, std::string("\"") + key + "\" must be a region name");
     const auto parsed = Gesture::regionFromName(found->get<std::string>());
     if (!parsed) fail(line, "unknown region \"" + found->get<std::string>() + "\"");
-    return static_cast<TruthRecord::Region>(*parsed);
+    return *parsed;
 }
 
 std::uint64_t ticks(const nlohmann::json& object, const char* key, int line)

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "host/Gesture.h"
+#include "records/Gesture.h"
 
 #include <cstdint>
 #include <string>
@@ -19,7 +19,7 @@ namespace VeltoTouch {
 // from touch-down to the event.
 struct TruthRecord {
     enum class Kind { Tap, Hold, Slide, Palm, Noise, Reset };
-    using Region = VeltoHost::Gesture::Region;
+    using Region = Gesture::Region;
 
     Kind kind = Kind::Tap;
     // Where the touch was (tap, hold) or began (slide); None for the others.

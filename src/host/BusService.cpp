@@ -1,6 +1,5 @@
 #include "host/BusService.h"
 
-#include "host/GestureFields.h"
 #include "platform/Log.h"
 #include "recording/JsonValue.h"
 
@@ -453,7 +452,11 @@ void BusService::emitManagerSignal(const char* member, const std::string& path)
 
 void BusService::publishEvent(DeviceId id, const HidEventRef& event)
 {
-    if (!event) return;
+    if (event) publishEvent(id, GestureFields::of(*event));
+}
+
+void BusService::publishEvent(DeviceId id, GestureFields fields)
+{
     if (_pendingSignals.fetch_add(1) >= kMaxPendingSignals) {
         _pendingSignals.fetch_sub(1);
         _signalsDropped.fetch_add(1);
@@ -462,18 +465,17 @@ void BusService::publishEvent(DeviceId id, const HidEventRef& event)
         }
         return;
     }
-    const bool queued = _connection.post([this, id, event] {
+    const bool queued = _connection.post([this, id, fields = std::move(fields)] {
         _pendingSignals.fetch_sub(1);
-        emitEvent(id, event);
+        emitEvent(id, fields);
     });
     if (!queued) _pendingSignals.fetch_sub(1);
 }
 
-void BusService::emitEvent(DeviceId id, const HidEventRef& event)
+void BusService::emitEvent(DeviceId id, const GestureFields& fields)
 {
     auto found = _devices.find(id);
     if (found == _devices.end()) return;
-    const GestureFields fields = GestureFields::of(*event);
     const char* path = found->second->path.c_str();
     int result = 0;
     if (fields.isDeviceReset) {

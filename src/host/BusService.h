@@ -2,6 +2,7 @@
 
 #include "host/BusConnection.h"
 #include "host/DeviceControl.h"
+#include "host/GestureFields.h"
 #include "host/RawDataAccess.h"
 #include "platform/HidEvent.h"
 #include "platform/SerialQueue.h"
@@ -122,9 +123,11 @@ public:
     // stopped. Unknown ids are ignored.
     void removeDevice(DeviceId id);
 
-    // Queues the signal for one event of a device: Gesture for a digitizer
-    // event, DeviceReset for a device reset. Never blocks on the bus; events
-    // of a device already removed are dropped.
+    // Queues the signal for one event of a device, decoded: Gesture for a
+    // digitizer event, DeviceReset for a device reset. Never blocks on the
+    // bus; events of a device already removed are dropped.
+    void publishEvent(DeviceId id, GestureFields fields);
+    // The same for an event still to be decoded; a null one is ignored.
     void publishEvent(DeviceId id, const HidEventRef& event);
 
     static std::string devicePath(DeviceId id);
@@ -181,7 +184,7 @@ private:
     void serveManager();
     void requestName();
     void emitManagerSignal(const char* member, const std::string& path);
-    void emitEvent(DeviceId id, const HidEventRef& event);
+    void emitEvent(DeviceId id, const GestureFields& fields);
     std::vector<std::string> devicePaths() const;
 
     const RawDataAccess _access;

@@ -1,6 +1,5 @@
 #include "host/DeviceSession.h"
 
-#include "host/Gesture.h"
 #include "host/SimulatedDevicePlayer.h"
 
 #include <stdexcept>
@@ -11,11 +10,6 @@ namespace VeltoHost {
 namespace {
 
 constexpr const char* kFactoryName = "VeltoTouchHIDServiceFactory";
-// A recording's state frames carry the pipeline's own keys; the host reaches
-// them through the plug-in's "Pipeline" domain.
-constexpr const char* kPipelineDomain = "Pipeline.";
-// As-fast-as-possible playback still leaves the device's queue room.
-constexpr std::size_t kMaxQueuedReports = 512;
 // Events kept for the bus while the device's object is being made: more
 // than a few seconds of touches; the object takes milliseconds.
 constexpr std::size_t kMaxEventsBeforeBusObject = 256;
@@ -37,7 +31,7 @@ DeviceSession::DeviceSession(std::string name, HostDevice::Ref device, const std
     try {
         const BusService::DeviceId id = _outputs.bus->addDevice(_control);
         std::lock_guard guard(_publishLock);
-        for (const HidEventRef& event : _beforeBusObject) _outputs.bus->publishEvent(id, event);
+        for (GestureFields& fields : _beforeBusObject) _outputs.bus->publishEvent(id, std::move(fields));
         _beforeBusObject.clear();
         _busId = id;
     } catch (...) {
@@ -99,9 +93,9 @@ std::uint64_t DeviceSession::play(const VeltoTouch::PipelineRecording& recording
     SimulatedDevicePlayer player(
         device,
         [this](const std::string& key, const PropertyValue& value) {
-            _control->setPropertyUnchecked(kPipelineDomain + key, value);
+            _control->setPropertyUnchecked(std::string(SimulatedDevicePlayer::kStateDomain) + key, value);
         },
-        [this] { return _stopPlaying.load(); }, {speed, kMaxQueuedReports});
+        [this] { return _stopPlaying.load(); }, {.speed = speed});
     for (const VeltoTouch::PipelineRecording::Frame& frame : recording.frames()) {
         if (!player.play(frame)) break;
     }
@@ -109,20 +103,24 @@ std::uint64_t DeviceSession::play(const VeltoTouch::PipelineRecording& recording
     return player.reportsPushed();
 }
 
+// Each event is decoded once, here: its gesture presses the keys and, with
+// its numbers, makes the bus signal.
 void DeviceSession::onEvent(const HidEventRef& event)
 {
-    publish(event);
-    sendKeys(_keyMap.handle(Gesture::of(*event)));
+    const Gesture gesture = Gesture::of(*event);
+    publish(*event, gesture);
+    sendKeys(_keyMap.handle(gesture));
 }
 
-void DeviceSession::publish(const HidEventRef& event)
+void DeviceSession::publish(const HidEvent& event, const Gesture& gesture)
 {
     if (!_outputs.bus) return;
+    GestureFields fields = GestureFields::of(event, gesture);
     std::lock_guard guard(_publishLock);
     if (const auto id = busId()) {
-        _outputs.bus->publishEvent(*id, event);
+        _outputs.bus->publishEvent(*id, std::move(fields));
     } else if (_beforeBusObject.size() < kMaxEventsBeforeBusObject) {
-        _beforeBusObject.push_back(event);
+        _beforeBusObject.push_back(std::move(fields));
     }
 }
 

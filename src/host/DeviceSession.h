@@ -82,7 +82,7 @@ public:
 
 private:
     void onEvent(const HidEventRef& event);
-    void publish(const HidEventRef& event);
+    void publish(const HidEvent& event, const Gesture& gesture);
     void sendKeys(const KeyMap::Actions& actions);
     void takeApart() noexcept;
 
@@ -99,7 +99,7 @@ private:
     // published after its DeviceAdded, in order. The lock orders publishing
     // against that hand-over.
     std::mutex _publishLock;
-    std::vector<HidEventRef> _beforeBusObject;  // guarded by _publishLock
+    std::vector<GestureFields> _beforeBusObject;  // guarded by _publishLock
     HostEventSystem::SubscriptionId _subscription = 0;
     // The host's event queue only, and the destructor once that is drained.
     KeyMap _keyMap;

@@ -1,15 +1,13 @@
 #include "host/GestureFields.h"
 
 #include "algs/Algs.h"
-#include "host/Gesture.h"
 
 namespace VeltoHost {
 
-GestureFields GestureFields::of(const HidEvent& event)
+GestureFields GestureFields::of(const HidEvent& event, const Gesture& gesture)
 {
-    const Gesture meaning = Gesture::of(event);
     GestureFields fields;
-    fields.gesture = Gesture::name(meaning.kind);
+    fields.gesture = Gesture::name(gesture.kind);
     fields.timestamp = event.timeStamp();
     if (event.kind() == HidEvent::Kind::VendorDefined) {
         fields.isDeviceReset = true;
@@ -18,7 +16,7 @@ GestureFields GestureFields::of(const HidEvent& event)
         return fields;
     }
     const HidEvent::Digitizer& digitizer = event.digitizer();
-    fields.region = Gesture::name(meaning.region);
+    fields.region = Gesture::name(gesture.region);
     fields.frame = event.integerValue(VeltoTouch::Algs::kFrameNumberField).value_or(0);
     fields.phase = event.phase();
     fields.eventMask = digitizer.eventMask;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "host/Gesture.h"
 #include "platform/HidEvent.h"
 
 #include <cstdint>
@@ -33,8 +34,11 @@ struct GestureFields {
     // Host clock ticks, as the pipeline stamped the event.
     std::uint64_t timestamp = 0;
 
-    // Names as Gesture gives them.
-    static GestureFields of(const HidEvent& event);
+    // The fields of an event whose gesture is decoded already, named as
+    // Gesture names them: the daemon decodes each event once, for its keys
+    // and its signals.
+    static GestureFields of(const HidEvent& event, const Gesture& gesture);
+    static GestureFields of(const HidEvent& event) { return of(event, Gesture::of(event)); }
 };
 
 }  // namespace VeltoHost

@@ -1,6 +1,6 @@
 #include "report/ReportCollector.h"
 
-#include "host/GestureFields.h"
+#include "records/Gesture.h"
 #include "records/TickConversion.h"
 #include "recording/JsonValue.h"
 
@@ -164,14 +164,16 @@ void ReportCollector::addEvents(const VeltoHost::HidEventList& events)
 {
     if (!_lastFrameIncluded || _frameCount == 0) return;
     for (const auto& event : events) {
-        const VeltoHost::GestureFields fields = VeltoHost::GestureFields::of(*event);
+        const Gesture gesture = Gesture::of(*event);
         nlohmann::ordered_json mark;
         mark["i"] = _frameCount - 1;
         mark["t"] = _nowUs;
-        mark["gesture"] = fields.gesture;
-        // A reset is handled as frame 0, the frame number its hold end carries.
-        mark["region"] = fields.isDeviceReset ? "none" : fields.region;
-        mark["frame"] = fields.isDeviceReset ? 0 : fields.frame;
+        mark["gesture"] = std::string(Gesture::name(gesture.kind));
+        // A reset is in no region, and is handled as frame 0, the frame
+        // number its hold end carries.
+        mark["region"] = std::string(Gesture::name(gesture.region));
+        const bool reset = gesture.kind == Gesture::Kind::DeviceReset;
+        mark["frame"] = reset ? 0 : event->integerValue(Algs::kFrameNumberField).value_or(0);
         _events.push_back(std::move(mark));
     }
 }

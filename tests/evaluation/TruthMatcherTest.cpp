@@ -10,7 +10,6 @@
 #include <vector>
 
 using namespace VeltoTouch;
-using Gesture = VeltoHost::Gesture;
 using Kind = TruthRecord::Kind;
 using Region = Gesture::Region;
 

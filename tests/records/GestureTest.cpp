@@ -1,11 +1,11 @@
-#include "host/Gesture.h"
+#include "records/Gesture.h"
 
 #include <gtest/gtest.h>
 
 #include <string>
 #include <vector>
 
-using VeltoHost::Gesture;
+using VeltoTouch::Gesture;
 using VeltoHost::HidEvent;
 using VeltoHost::HidEventRef;
 using Kind = Gesture::Kind;
@@ -35,13 +35,27 @@ TEST(GestureTest, EventsNotFromThisRecogniserAreUnknownOrInNoRegion)
     const std::vector<Case> cases = {
         {"no phase, no tap bit", digitizer(0, 3, 0), {Kind::Unknown, Region::Top}},
         {"two phases", digitizer(2, 1, HidEvent::kPhaseBegan | HidEvent::kPhaseEnded), {Kind::Unknown, Region::Middle}},
-        {"y between regions", digitizer(0x20000, 2.5, 0), {Kind::Tap, Region::None}},
-        {"y beyond the top", digitizer(0x20000, 4, 0), {Kind::Tap, Region::None}},
-        {"negative y", digitizer(0x20000, -1, 0), {Kind::Tap, Region::None}},
+        {"y between regions", digitizer(Gesture::kTapEventMask, 2.5, 0), {Kind::Tap, Region::None}},
+        {"y beyond the top", digitizer(Gesture::kTapEventMask, 4, 0), {Kind::Tap, Region::None}},
+        {"negative y", digitizer(Gesture::kTapEventMask, -1, 0), {Kind::Tap, Region::None}},
     };
     for (const Case& each : cases) {
         const Gesture gesture = Gesture::of(*each.event);
         EXPECT_EQ(gesture, each.expected) << each.name << ": " << Gesture::name(gesture.kind) << " "
                                           << Gesture::name(gesture.region);
     }
+}
+
+// Every gesture the recogniser can make reads back as itself.
+TEST(GestureTest, EveryDigitizerGestureDecodesAsEncoded)
+{
+    for (Kind kind : {Kind::MayBegin, Kind::Tap, Kind::HoldStart, Kind::HoldChange, Kind::HoldEnd, Kind::Cancel}) {
+        for (Region region : {Region::None, Region::Middle, Region::Bottom, Region::Top}) {
+            const HidEventRef event = Gesture{kind, region}.event();
+            ASSERT_TRUE(event) << Gesture::name(kind);
+            EXPECT_EQ(Gesture::of(*event), (Gesture{kind, region})) << Gesture::name(kind) << " " << Gesture::name(region);
+        }
+    }
+    EXPECT_FALSE((Gesture{Kind::DeviceReset, Region::None}.event()));
+    EXPECT_FALSE((Gesture{Kind::Unknown, Region::None}.event()));
 }
