@@ -4,6 +4,7 @@
 #include "host/Daemon.h"
 #include "host/JournalLogSink.h"
 #include "host/PluginLocator.h"
+#include "host/SimulatedDevicePlayer.h"
 #include "host/StopSignals.h"
 #include "host/UdevDeviceWatcher.h"
 #include "platform/Log.h"
@@ -12,7 +13,7 @@
 #include <malloc.h>
 
 #include <memory>
-#include <string_view>
+#include <optional>
 
 namespace VeltoTool {
 
@@ -20,7 +21,6 @@ using namespace VeltoHost;
 
 namespace {
 
-constexpr std::string_view kSimulatedPrefix = "sim:";
 constexpr int kLargeBlockBytes = 1 << 20;
 
 // Why a daemon ended with nothing to serve, in the terms of its command line.
@@ -48,12 +48,13 @@ int DaemonCommand::run(const Options& options, std::ostream& err)
     Daemon::Options daemon;
     daemon.bus = BusConnection::Address::parse(options.bus);
     daemon.speed = options.speed;
+    daemon.hidDevice = options.hidDevice;
     daemon.keys = options.keys;
     daemon.configPath = options.config;
     if (!options.config.empty()) daemon.config = DaemonConfig::load(options.config);
     for (const std::string& device : options.devices) {
-        if (device.starts_with(kSimulatedPrefix)) {
-            daemon.simulatedFiles.push_back(device.substr(kSimulatedPrefix.size()));
+        if (std::optional<std::string> file = SimulatedDevicePlayer::recordingPath(device)) {
+            daemon.simulatedFiles.push_back(std::move(*file));
         } else {
             daemon.devicePaths.push_back(device);
         }

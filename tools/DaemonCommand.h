@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstdint>
+#include <optional>
 #include <ostream>
 #include <string>
 #include <vector>
@@ -17,6 +19,9 @@ public:
         std::string bus = "system";        // "system", "session" or a bus address
         std::vector<std::string> devices;  // sim:FILE or /dev/hidrawN
         double speed = 1.0;
+        // Of a sim:FILE that is a hid-recorder text of several devices, the
+        // one to play; empty: the one with the surface's reports.
+        std::optional<std::uint32_t> hidDevice;
         bool udev = true;
         bool keys = true;
         std::string plugin;  // empty: look for it (PluginLocator)

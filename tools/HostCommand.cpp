@@ -18,7 +18,6 @@
 
 #include <cerrno>
 #include <chrono>
-#include <cstring>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -35,17 +34,12 @@ using VeltoTouch::PipelineRecording;
 namespace {
 
 constexpr const char* kFactoryName = "VeltoTouchHIDServiceFactory";
-constexpr const char* kSimulatedPrefix = "sim:";
 constexpr const char* kCountersKey = "Pipeline.Algs.EventStats";
-// A recording's state frames are the pipeline's own keys; the host reaches
-// them through the plug-in's "Pipeline" domain.
-constexpr const char* kPipelineDomain = "Pipeline.";
 // Waits are cut into slices this long so that a signal ends them promptly.
 constexpr std::uint64_t kWaitSliceMicroseconds = 20'000;
 // After a stop, the plug-in gets this long to take the reports it was given.
 constexpr auto kFinishTimeout = std::chrono::seconds(5);
-// As-fast-as-possible playback still leaves the device's queue room.
-constexpr std::size_t kMaxQueuedReports = 512;
+
 void printSummary(const PropertyValue& stats, std::uint64_t discarded, std::ostream& out)
 {
     out << "\nGesture counters (" << kCountersKey << "):\n";
@@ -74,14 +68,11 @@ struct Device {
     ToolFiles::File recording{nullptr, &std::fclose};
 };
 
-// Thrown from the recording's frame handler to end the playback.
-struct PlaybackStopped {};
-
 Device openDevice(const std::string& name)
 {
     Device device;
-    if (name.rfind(kSimulatedPrefix, 0) == 0) {
-        device.recordingPath = name.substr(std::strlen(kSimulatedPrefix));
+    if (std::optional<std::string> path = VeltoHost::SimulatedDevicePlayer::recordingPath(name)) {
+        device.recordingPath = std::move(*path);
         device.recording = ToolFiles::openRecording(device.recordingPath);
         device.simulated = SimulatedHostDevice::create();
         device.device = device.simulated;
@@ -136,30 +127,30 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
     std::uint64_t discarded = 0;
     std::string fault;
     if (device.simulated) {
-        VeltoHost::SimulatedDevicePlayer player(
+        using VeltoHost::SimulatedDevicePlayer;
+        SimulatedDevicePlayer player(
             device.simulated,
-            [&](const std::string& key, const PropertyValue& value) { host.setProperty(kPipelineDomain + key, value); },
-            &StopSignals::requested, {options.speed, kMaxQueuedReports},
+            [&](const std::string& key, const PropertyValue& value) {
+                host.setProperty(std::string(SimulatedDevicePlayer::kStateDomain) + key, value);
+            },
+            &StopSignals::requested, {.speed = options.speed},
             VeltoHost::GapCap(options.maxGapSeconds,
                               [&](const std::string& note) { err << "veltotouch: note: " << note << std::endl; }));
-        // Played as it is read, so that a recording of any length fits in memory.
-        bool played = false;
+        // Played as it is read, so that a recording of any length fits in
+        // memory; the faults in the words of the tool's other readers.
         bool stopped = false;
         try {
-            stopped = !ToolFiles::streamRecording(
-                device.recording.get(), device.recordingPath,
-                [&](PipelineRecording::Frame&& frame) {
-                    if (!player.play(frame)) throw PlaybackStopped{};
-                    played = true;
-                },
-                &StopSignals::requested, options.hidDevice);
-        } catch (const PlaybackStopped&) {
-            stopped = true;
+            stopped = player.playStream([&](const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+                                            const SimulatedDevicePlayer::StopCheck& stopRequested) {
+                ToolFiles::streamRecording(device.recording.get(), device.recordingPath, onFrame, stopRequested,
+                                           options.hidDevice);
+            }) == SimulatedDevicePlayer::Ending::Stopped;
         } catch (const ToolError& error) {
             // A fault further into the recording: what came before it is
             // finished and reported as at the end, then the fault.
             fault = error.what();
         }
+        const bool played = player.framesPlayed() > 0;
         if (stopped && !played) err << "veltotouch: stopped while loading " << device.recordingPath << std::endl;
         // Whatever the device was given, the plug-in takes before the end is read.
         if (!device.simulated->waitUntilIdle(kFinishTimeout)) discarded = device.simulated->pendingReportCount();

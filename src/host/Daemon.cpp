@@ -5,17 +5,19 @@
 #include "platform/HidrawNode.h"
 #include "platform/RunLoop.h"
 #include "platform/SimulatedHostDevice.h"
+#include "recording/ContainerStream.h"
 
 #include <systemd/sd-daemon.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cinttypes>
+#include <cstdio>
 #include <cstring>
 #include <ctime>
-#include <fstream>
-#include <sstream>
+#include <memory>
 #include <stdexcept>
 #include <thread>
 #include <utility>
@@ -24,20 +26,28 @@ namespace VeltoHost {
 
 namespace {
 
-constexpr const char* kSimulatedPrefix = "sim:";
 // How often run() looks at the stop and reload requests and the bus between events.
 constexpr auto kPollInterval = std::chrono::milliseconds(100);
 
-std::string fileText(const std::string& path)
+using RecordingFile = std::unique_ptr<std::FILE, int (*)(std::FILE*)>;
+
+// A file that does not start as a recording is no device: its first fault,
+// if it comes before the first frame, is raised here. The file is read up to
+// its first frame and put back at its start. An input that cannot be read
+// again (a pipe) is left as it is, its faults found as it plays.
+void checkStartsAsRecording(int fd, std::optional<std::uint32_t> hidDevice)
 {
-    errno = 0;
-    std::ifstream file(path, std::ios::binary);
-    if (!file) {
-        throw std::runtime_error(std::string("cannot be read: ") + (errno ? std::strerror(errno) : "unknown error"));
+    const off_t start = ::lseek(fd, 0, SEEK_CUR);
+    if (start < 0) return;
+    struct FirstFrame {};
+    try {
+        VeltoTouch::ContainerStream::read(
+            fd, [](VeltoTouch::PipelineRecording::Frame&&) { throw FirstFrame{}; }, {}, hidDevice);
+    } catch (const FirstFrame&) {
     }
-    std::ostringstream text;
-    text << file.rdbuf();
-    return text.str();
+    if (::lseek(fd, start, SEEK_SET) != start) {
+        throw std::runtime_error(std::string("cannot be read again from its start: ") + std::strerror(errno));
+    }
 }
 
 // Sets the configuration's level before anything logs; returns the one it replaced.
@@ -91,8 +101,12 @@ Daemon::Daemon(Options options, std::unique_ptr<DeviceWatcher> watcher, DeviceOp
 Daemon::~Daemon()
 {
     if (_watcher) _watcher->stop();
-    // In order of attachment, each device taken apart whole before the next.
-    for (Attached& attached : _sessions) attached.session.reset();
+    // In order of attachment, each device taken apart whole before the next,
+    // its playback first.
+    for (Attached& attached : _sessions) {
+        attached.player = {};
+        attached.session.reset();
+    }
 }
 
 Daemon::Ending Daemon::run(const std::function<bool()>& stopRequested, const std::function<bool()>& reloadRequested)
@@ -178,8 +192,9 @@ void Daemon::applyKeys(const KeyMap::Bindings& keys)
     const std::set<unsigned int> codes = KeyMap(keys).keyCodes();
     std::unique_ptr<KeyboardSink> retired;
     // A keyboard offers only the keys it was made with; one that lacks a new
-    // key is made anew. One that merely offers a key no longer bound stays:
-    // a key nobody sends costs nothing, a new input device disturbs desktops.
+    // key is made anew. One that merely offers a key the new map leaves
+    // unbound stays: a key nobody sends costs nothing, a new input device
+    // disturbs desktops.
     if (_keyboard && !std::includes(_keyboardCodes.begin(), _keyboardCodes.end(), codes.begin(), codes.end())) {
         MadeKeyboard made = _makeKeyboard(codes);
         if (made.keyboard) {
@@ -216,18 +231,42 @@ void Daemon::applyMatches()
 
 void Daemon::attachSimulated(const std::string& file)
 {
-    const std::string name = kSimulatedPrefix + file;
-    std::optional<VeltoTouch::PipelineRecording> recording;
+    const std::string name = std::string(SimulatedDevicePlayer::kDevicePrefix) + file;
+    errno = 0;
+    RecordingFile recording(std::fopen(file.c_str(), "rbe"), &std::fclose);
     try {
-        recording.emplace(std::string_view(fileText(file)));
+        if (!recording) {
+            throw std::runtime_error(std::string("cannot be read: ") +
+                                     (errno ? std::strerror(errno) : "unknown error"));
+        }
+        checkStartsAsRecording(::fileno(recording.get()), _options.hidDevice);
     } catch (const std::exception& error) {
         _log.error("%s: not attached: %s", name, error.what());
         return;
     }
     SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
-    if (DeviceSession* session = attach(name, device, false)) {
-        session->playInBackground(std::move(*recording), device, _options.speed);
-    }
+    DeviceSession* session = attach(name, device, false);
+    if (!session) return;
+    // The session outlives the thread that plays into it: Attached::player
+    // is stopped and joined before the session is taken apart.
+    _sessions.back().player = std::jthread([log = _log, name, session, device = std::move(device),
+                                            recording = std::move(recording), speed = _options.speed,
+                                            hidDevice = _options.hidDevice](std::stop_token stop) {
+        SimulatedDevicePlayer player(
+            device,
+            [session](const std::string& key, const PropertyValue& value) {
+                session->control().setPropertyUnchecked(std::string(SimulatedDevicePlayer::kStateDomain) + key,
+                                                        value);
+            },
+            [&stop] { return stop.stop_requested(); }, {.speed = speed});
+        try {
+            player.playStream(SimulatedDevicePlayer::readAhead(::fileno(recording.get()), hidDevice));
+        } catch (const std::exception& error) {
+            log.error("%s: played up to a fault, after %ju frames; the device stays attached: %s", name,
+                      player.framesPlayed(), error.what());
+        }
+        player.waitUntilTaken();
+    });
 }
 
 void Daemon::attachGivenPath(const std::string& path)
@@ -270,7 +309,7 @@ DeviceSession* Daemon::attach(const std::string& name, HostDevice::Ref device, b
     try {
         auto session =
             std::make_unique<DeviceSession>(name, std::move(device), _options.pluginPath, std::move(outputs));
-        _sessions.push_back({name, watched, std::move(session)});
+        _sessions.push_back({name, watched, std::move(session), {}});
     } catch (const std::exception& error) {
         // One device that will not start does not stop the others.
         _log.error("%s: not attached: %s", name, error.what());

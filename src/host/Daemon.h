@@ -9,7 +9,9 @@
 #include "host/UinputKeyboard.h"
 #include "platform/HostDevice.h"
 #include "platform/Log.h"
+#include "platform/SimulatedHostDevice.h"
 
+#include <cstdint>
 #include <functional>
 #include <map>
 #include <memory>
@@ -17,6 +19,7 @@
 #include <optional>
 #include <set>
 #include <string>
+#include <thread>
 #include <vector>
 
 namespace VeltoHost {
@@ -32,8 +35,11 @@ namespace VeltoHost {
 // destructor takes the sessions apart there in the order they were attached.
 //
 // A device that cannot be had (a path that is no hidraw node, a recording
-// that cannot be read, a plug-in that will not start on it) is logged with
-// its name and left out; the others are served. A service with nothing to
+// that cannot be read or does not start as one, a plug-in that will not
+// start on it) is logged with its name and left out; the others are served.
+// A simulated device plays its recording as the file is read, on a thread of
+// its own (SimulatedDevicePlayer); a fault further into the file is logged
+// where it is reached, and the device stays attached with what it played. A service with nothing to
 // serve and no way of ever getting a device, or without its bus, ends run()
 // and says why, so that the service manager can report it or start it again.
 class Daemon {
@@ -46,6 +52,9 @@ public:
         // Hidraw nodes given by hand, whatever their ids; no other path is taken.
         std::vector<std::string> devicePaths;
         double speed = 1.0;                       // of the simulated devices; 0 as fast as taken
+        // Of a simulated device's hid-recorder file holding several devices,
+        // the one to play; empty: the one with the surface's reports.
+        std::optional<std::uint32_t> hidDevice;
         bool keys = true;
         std::string uinputPath = UinputKeyboard::kDefaultUinputPath;
         DaemonConfig config;
@@ -83,7 +92,7 @@ public:
 
     // Starts the watcher (the devices present are attached), tells systemd the
     // service is ready, and serves until `stopRequested` turns true or the
-    // service can serve nothing any more. Whenever `reloadRequested` answers
+    // service has nothing left to serve. Whenever `reloadRequested` answers
     // true, reads the configuration file again (see reload()).
     Ending run(const std::function<bool()>& stopRequested, const std::function<bool()>& reloadRequested = {});
 
@@ -91,14 +100,19 @@ private:
     // One attached device.
     struct Attached {
         std::string name;
-        bool watched = false;  // reported by the watcher, not given by hand: released when no longer matched
+        // Reported by the watcher, not given by hand: released when the
+        // configuration stops matching it.
+        bool watched = false;
         std::unique_ptr<DeviceSession> session;
+        // A simulated device's playback. Declared last, so that it is stopped
+        // and joined before the session it plays into is taken apart.
+        std::jthread player;
     };
 
     // Reads Options::configPath again and applies it: the log level, the key
     // map of every device (a keyboard made anew when the keys need codes the
     // old one lacks), and the matches (devices present that are now matched
-    // are attached, watched ones no longer matched released; devices given
+    // are attached, watched ones it stops matching released; devices given
     // by hand stay). A file that cannot be read or has a fault is logged with
     // its place and changes nothing.
     void reload();
@@ -109,6 +123,8 @@ private:
     void applyMatches();
     bool nothingToServe() const;
 
+    // Attaches the file as a simulated device once it starts as a recording,
+    // and starts its playback.
     void attachSimulated(const std::string& file);
     void attachGivenPath(const std::string& path);
     // The new session, or null when the device would not start (logged).

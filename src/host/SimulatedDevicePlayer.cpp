@@ -1,6 +1,8 @@
 #include "host/SimulatedDevicePlayer.h"
 
 #include "platform/MonotonicClock.h"
+#include "records/TickConversion.h"
+#include "recording/ContainerReadAhead.h"
 
 #include <algorithm>
 #include <chrono>
@@ -17,14 +19,25 @@ constexpr std::uint64_t kQueueFullPauseMicroseconds = 200;
 // No step of the schedule is longer than a year: the deadline stays far from overflow.
 constexpr std::uint64_t kLongestScheduleStepNs = 365ull * 24 * 3600 * 1'000'000'000ull;
 
-std::uint64_t monotonicNanoseconds()
-{
-    return static_cast<std::uint64_t>(
-        std::chrono::duration_cast<std::chrono::nanoseconds>(std::chrono::steady_clock::now().time_since_epoch())
-            .count());
-}
+// Thrown from the frame handler to end a stream once a stop is requested.
+struct PlaybackStopped {};
+
+std::uint64_t nowNanoseconds() { return VeltoTouch::Util::nanosecondsFromMachTime(MonotonicClock::now()); }
 
 }  // namespace
+
+std::optional<std::string> SimulatedDevicePlayer::recordingPath(std::string_view deviceName)
+{
+    if (!deviceName.starts_with(kDevicePrefix)) return std::nullopt;
+    return std::string(deviceName.substr(kDevicePrefix.size()));
+}
+
+SimulatedDevicePlayer::FrameSource SimulatedDevicePlayer::readAhead(int fd, std::optional<std::uint32_t> hidDevice)
+{
+    return [fd, hidDevice](const VeltoTouch::ContainerStream::FrameHandler& onFrame, const StopCheck& stopRequested) {
+        VeltoTouch::ContainerReadAhead::read(fd, onFrame, stopRequested, hidDevice);
+    };
+}
 
 SimulatedDevicePlayer::SimulatedDevicePlayer(SimulatedHostDevice::Ref device, StateWriter writeState,
                                              StopCheck shouldStop, Options options, GapCap gapCap)
@@ -34,6 +47,24 @@ SimulatedDevicePlayer::SimulatedDevicePlayer(SimulatedHostDevice::Ref device, St
       _options(options),
       _gapCap(std::move(gapCap))
 {
+}
+
+SimulatedDevicePlayer::Ending SimulatedDevicePlayer::playStream(const FrameSource& source)
+{
+    try {
+        source(
+            [this](VeltoTouch::PipelineRecording::Frame&& frame) {
+                if (!play(frame)) throw PlaybackStopped{};
+            },
+            _shouldStop);
+    } catch (const PlaybackStopped&) {
+        return Ending::Stopped;
+    } catch (...) {
+        // A stop cuts the input short, which the reader may take for a fault.
+        if (_shouldStop()) return Ending::Stopped;
+        throw;
+    }
+    return _shouldStop() ? Ending::Stopped : Ending::Finished;
 }
 
 bool SimulatedDevicePlayer::play(const VeltoTouch::PipelineRecording::Frame& frame)
@@ -72,7 +103,7 @@ bool SimulatedDevicePlayer::waitUntilTaken()
 
 void SimulatedDevicePlayer::pace(std::uint64_t timestampNs)
 {
-    const std::uint64_t now = monotonicNanoseconds();
+    const std::uint64_t now = nowNanoseconds();
     if (!_previousReportNs) {
         _deadlineNs = now;
     } else if (timestampNs > *_previousReportNs) {
@@ -89,7 +120,7 @@ void SimulatedDevicePlayer::pace(std::uint64_t timestampNs)
 
 bool SimulatedDevicePlayer::sleepUntil(std::uint64_t deadlineNs)
 {
-    for (std::uint64_t now = monotonicNanoseconds(); now < deadlineNs; now = monotonicNanoseconds()) {
+    for (std::uint64_t now = nowNanoseconds(); now < deadlineNs; now = nowNanoseconds()) {
         if (_shouldStop()) return false;
         MonotonicClock::sleepMicroseconds(std::min(deadlineNs - now, kWaitSliceNs) / 1000);
     }

@@ -201,7 +201,9 @@ void HidrawHostDevice::onReadable()
         if (_readBuffer.empty()) _readBuffer.resize(kMaxReportSize);
     }
     ssize_t count = read(descriptor->fd, _readBuffer.data(), _readBuffer.size());
-    std::uint64_t timeStamp = MonotonicClock::now();
+    // The report's one time stamp: the plug-in records it at this time and
+    // hands the same time to its pipeline, whenever its turn comes.
+    const std::uint64_t timeStamp = MonotonicClock::now();
     if (count < 0) {
         if (errno == EAGAIN || errno == EWOULDBLOCK || errno == EINTR) return;
         endReception(errno);

@@ -17,18 +17,7 @@ using Util::hexDigit;
 
 namespace {
 
-constexpr std::string_view kTypeKey = "Type";
-constexpr std::string_view kTimestampKey = "Timestamp";
-constexpr std::string_view kKeyKey = "Key";
-constexpr std::string_view kValueKey = "Value";
-constexpr std::string_view kReportKey = "Report";
-constexpr std::string_view kStateType = "State";
-constexpr std::string_view kInputReportType = "InputReport";
-constexpr std::string_view kReportDataKey = "ReportData";
-
 [[noreturn]] void reject(const char* message) { throw std::invalid_argument(message); }
-
-
 
 // Report text as the writer produces it (two hex digits and a blank per byte)
 // is decoded directly; anything else goes to the general hex reader, which

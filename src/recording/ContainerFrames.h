@@ -13,10 +13,20 @@ namespace VeltoTouch {
 // refused, with the same message, whichever read it.
 class ContainerFrames {
 public:
+    // The container's names, for every reader and the writer (ContainerWriter).
     static constexpr std::string_view kVersionKey = "Version";
     static constexpr std::string_view kFramesKey = "Frames";
-    // Version 0.
+    // A frame object's entries, and the names of its two types.
+    static constexpr std::string_view kTypeKey = "Type";
+    static constexpr std::string_view kTimestampKey = "Timestamp";
+    static constexpr std::string_view kKeyKey = "Key";
+    static constexpr std::string_view kValueKey = "Value";
+    static constexpr std::string_view kReportKey = "Report";
+    static constexpr std::string_view kStateType = "State";
+    static constexpr std::string_view kInputReportType = "InputReport";
+    // Version 0: the report list, and a report object's bytes.
     static constexpr std::string_view kReportsKey = "Reports";
+    static constexpr std::string_view kReportDataKey = "ReportData";
 
     // A frame object of a version-1 container. Raises std::invalid_argument:
     // "frame is not an object", "invalid frame type", "invalid frame

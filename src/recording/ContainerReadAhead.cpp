@@ -1,10 +1,8 @@
 #include "recording/ContainerReadAhead.h"
 
-#include <atomic>
-#include <condition_variable>
-#include <deque>
+#include "platform/BoundedQueue.h"
+
 #include <exception>
-#include <mutex>
 #include <thread>
 #include <utility>
 #include <vector>
@@ -14,6 +12,7 @@ namespace VeltoTouch {
 namespace {
 
 using Frame = PipelineRecording::Frame;
+using Batch = std::vector<Frame>;
 
 // Frames travel in batches so that the two threads meet once per batch, not
 // once per frame; a few batches ahead keep the player fed through the
@@ -30,77 +29,46 @@ std::uint64_t ContainerReadAhead::read(int fd, const ContainerStream::FrameHandl
                                        const std::function<bool()>& stopRequested,
                                        std::optional<std::uint32_t> hidDevice)
 {
-    std::mutex mutex;
-    std::condition_variable changed;
-    // Under `mutex`:
-    std::deque<std::vector<Frame>> ready;
-    bool finished = false;
+    // The player closes it when it gives up, the reader when the input ends.
+    VeltoHost::BoundedQueue<Batch> ready(kBatchesAhead);
+    // Written by the reader before it closes the queue, read after the join.
     std::uint64_t version = 0;
     std::exception_ptr failure;
-    // Read without the lock by the parser's stop check.
-    std::atomic<bool> abandoned{false};
 
     std::thread reader([&] {
-        std::vector<Frame> batch;
-        // `mustWait`: a full batch waits for room; the last one never does,
-        // so that the frames before a fault always arrive.
-        const auto handOver = [&](bool mustWait) {
-            std::unique_lock lock(mutex);
-            if (mustWait) changed.wait(lock, [&] { return ready.size() < kBatchesAhead || abandoned; });
-            if (abandoned) throw Abandoned{};
-            if (!batch.empty()) ready.push_back(std::exchange(batch, {}));
-            changed.notify_all();
+        Batch batch;
+        const auto handOver = [&] {
+            if (!batch.empty() && !ready.push(std::exchange(batch, {}))) throw Abandoned{};
         };
-        std::uint64_t stated = 0;
-        std::exception_ptr error;
         try {
-            stated = ContainerStream::read(
+            version = ContainerStream::read(
                 fd,
                 [&](Frame&& frame) {
                     batch.push_back(std::move(frame));
-                    if (batch.size() == kFramesPerBatch) handOver(true);
+                    if (batch.size() == kFramesPerBatch) handOver();
                 },
-                [&] { return abandoned || (stopRequested && stopRequested()); }, hidDevice);
+                [&] { return ready.closed() || (stopRequested && stopRequested()); }, hidDevice);
         } catch (const Abandoned&) {
             return;
         } catch (...) {
-            error = std::current_exception();
+            failure = std::current_exception();
         }
+        // The frames before a fault arrive before it.
         try {
-            handOver(false);
+            handOver();
         } catch (const Abandoned&) {
             return;
         }
-        std::lock_guard lock(mutex);
-        version = stated;
-        failure = error;
-        finished = true;
-        changed.notify_all();
+        ready.close();
     });
 
-    const auto abandon = [&] {
-        {
-            std::lock_guard lock(mutex);
-            abandoned = true;
-        }
-        changed.notify_all();
-        reader.join();
-    };
     try {
-        for (;;) {
-            std::vector<Frame> batch;
-            {
-                std::unique_lock lock(mutex);
-                changed.wait(lock, [&] { return !ready.empty() || finished; });
-                if (ready.empty()) break;
-                batch = std::move(ready.front());
-                ready.pop_front();
-            }
-            changed.notify_all();
-            for (Frame& frame : batch) onFrame(std::move(frame));
+        while (std::optional<Batch> batch = ready.pop()) {
+            for (Frame& frame : *batch) onFrame(std::move(frame));
         }
     } catch (...) {
-        abandon();
+        ready.close();
+        reader.join();
         throw;
     }
     reader.join();

@@ -1,6 +1,7 @@
 #include "recording/ContainerWriter.h"
 
 #include "records/HexText.h"
+#include "recording/ContainerFrames.h"
 #include "recording/JsonValue.h"
 
 #include <nlohmann/json.hpp>
@@ -14,19 +15,35 @@ namespace VeltoTouch {
 
 namespace {
 
+using Names = ContainerFrames;
+
 // The container is indented two blanks per level; a frame object sits two
-// levels deep, inside the top-level object and its "Frames" array.
-constexpr std::string_view kOpeningHead = "{\n  \"Version\": ";
-constexpr std::string_view kOpeningTail = ",\n  \"Frames\": [";
+// levels deep, inside the top-level object and its frame array.
 constexpr std::string_view kFrameIndent = "    ";
 constexpr std::string_view kClosingAfterFrames = "\n  ]\n}";
 constexpr std::string_view kClosingWithoutFrames = "]\n}";
 
-// Text that JSON writes as it stands, with nothing to escape: the frame type
-// names and report hex text.
-constexpr std::string_view kReportFrameHead = "{\n      \"Type\": \"InputReport\",\n      \"Timestamp\": ";
-constexpr std::string_view kReportFrameReport = ",\n      \"Report\": \"";
-constexpr std::string_view kReportFrameTail = "\"\n    }";
+// A name as JSON text; the container's names have nothing to escape.
+std::string quoted(std::string_view name) { return '"' + std::string(name) + '"'; }
+
+// The fixed text around the numbers and the report bytes, made once from the
+// names the readers take (ContainerFrames). A report frame is written as it
+// stands, without the JSON library: its type name and hex text need no
+// escaping, and this is most of a recording.
+struct FixedText {
+    std::string openingHead = "{\n  " + quoted(Names::kVersionKey) + ": ";
+    std::string openingTail = ",\n  " + quoted(Names::kFramesKey) + ": [";
+    std::string reportFrameHead = "{\n      " + quoted(Names::kTypeKey) + ": " + quoted(Names::kInputReportType) +
+                                  ",\n      " + quoted(Names::kTimestampKey) + ": ";
+    std::string reportFrameReport = ",\n      " + quoted(Names::kReportKey) + ": \"";
+    std::string reportFrameTail = "\"\n    }";
+};
+
+const FixedText& fixedText()
+{
+    static const FixedText text;
+    return text;
+}
 
 // Digits as the JSON library writes them, whatever locale or base the
 // stream was set up with.
@@ -41,9 +58,10 @@ void writeDecimal(std::ostream& out, std::uint64_t number)
 
 ContainerWriter::ContainerWriter(std::ostream& out) : _out(out)
 {
-    _out << kOpeningHead;
+    const FixedText& text = fixedText();
+    _out << text.openingHead;
     writeDecimal(_out, kVersion);
-    _out << kOpeningTail;
+    _out << text.openingTail;
 }
 
 void ContainerWriter::write(const PipelineRecording::Frame& frame)
@@ -83,13 +101,13 @@ void ContainerWriter::writeStateFrame(const PipelineRecording::Frame& frame)
     // moved to the frame's depth line by line. Raw line breaks occur only
     // between JSON tokens (strings escape theirs), so no string is touched.
     nlohmann::ordered_json object = nlohmann::ordered_json::object();
-    object["Type"] = "State";
-    object["Timestamp"] = frame.timestampNs;
-    object["Key"] = frame.key;
+    object[std::string(Names::kTypeKey)] = std::string(Names::kStateType);
+    object[std::string(Names::kTimestampKey)] = frame.timestampNs;
+    object[std::string(Names::kKeyKey)] = frame.key;
     // Values JSON cannot hold are written as JsonValue::toJson says: byte
     // data as hex text, non-finite numbers as null; invalid UTF-8 becomes
     // U+FFFD. Writing never fails.
-    if (frame.value.hasValue()) object["Value"] = JsonValue::toJson(frame.value);
+    if (frame.value.hasValue()) object[std::string(Names::kValueKey)] = JsonValue::toJson(frame.value);
     const std::string text = JsonValue::dump(object, true);
     std::string::size_type start = 0;
     for (auto lineBreak = text.find('\n'); lineBreak != std::string::npos; lineBreak = text.find('\n', start)) {
@@ -102,9 +120,10 @@ void ContainerWriter::writeStateFrame(const PipelineRecording::Frame& frame)
 
 void ContainerWriter::writeReportFrame(const PipelineRecording::Frame& frame)
 {
-    _out << kReportFrameHead;
+    const FixedText& text = fixedText();
+    _out << text.reportFrameHead;
     writeDecimal(_out, frame.timestampNs);
-    _out << kReportFrameReport << Util::hexStringFromBytes(frame.report) << kReportFrameTail;
+    _out << text.reportFrameReport << Util::hexStringFromBytes(frame.report) << text.reportFrameTail;
 }
 
 }  // namespace VeltoTouch

@@ -70,7 +70,8 @@ PipelineRecording::PipelineRecording(const PipelineRecording& other)
       sleepMicroseconds(other.sleepMicroseconds),
       _frames(other._frames),
       _maxFrameCount(other._maxFrameCount),
-      _framesKeptByLastTrim(other._framesKeptByLastTrim)
+      _framesKeptByLastTrim(other._framesKeptByLastTrim),
+      _newestTime(other._newestTime)
 {
     // _play stays not valid: the source's position belongs to the source's list.
 }
@@ -83,6 +84,7 @@ PipelineRecording& PipelineRecording::operator=(const PipelineRecording& other)
     _frames = other._frames;
     _maxFrameCount = other._maxFrameCount;
     _framesKeptByLastTrim = other._framesKeptByLastTrim;
+    _newestTime = other._newestTime;
     _play = PlayCursor{};
     return *this;
 }
@@ -93,7 +95,8 @@ PipelineRecording::PipelineRecording(PipelineRecording&& other) noexcept
       sleepMicroseconds(std::move(other.sleepMicroseconds)),
       _frames(std::move(other._frames)),
       _maxFrameCount(other._maxFrameCount),
-      _framesKeptByLastTrim(other._framesKeptByLastTrim)
+      _framesKeptByLastTrim(other._framesKeptByLastTrim),
+      _newestTime(other._newestTime)
 {
     other._play = PlayCursor{};
 }
@@ -106,6 +109,7 @@ PipelineRecording& PipelineRecording::operator=(PipelineRecording&& other) noexc
     _frames = std::move(other._frames);
     _maxFrameCount = other._maxFrameCount;
     _framesKeptByLastTrim = other._framesKeptByLastTrim;
+    _newestTime = other._newestTime;
     _play = PlayCursor{};
     other._play = PlayCursor{};
     return *this;
@@ -116,8 +120,10 @@ void PipelineRecording::setTime(std::uint64_t) {}
 void PipelineRecording::setState(const std::string& key, PropertyValue value)
 {
     // One clock reading serves both the frame and the forwarded time, so a
-    // replay sees the same time line as the live pipeline did.
-    const std::uint64_t now = MonotonicClock::now();
+    // replay sees the same time line as the live pipeline did. The clock
+    // never runs back, so no report recorded before can be later.
+    const std::uint64_t now = std::max(MonotonicClock::now(), _newestTime);
+    _newestTime = now;
     Frame frame;
     frame.type = Frame::Type::State;
     frame.timestampNs = Util::nanosecondsFromMachTime(now);
@@ -132,14 +138,21 @@ void PipelineRecording::setState(const std::string& key, PropertyValue value)
 
 void PipelineRecording::handleInputReport(const std::uint8_t* data, std::size_t length)
 {
-    const std::uint64_t now = MonotonicClock::now();
+    handleInputReportAt(MonotonicClock::now(), data, length);
+}
+
+void PipelineRecording::handleInputReportAt(std::uint64_t timeStamp, const std::uint8_t* data, std::size_t length)
+{
+    // As for a state: the frame and the forwarded time are the same reading.
+    const std::uint64_t time = std::max(timeStamp, _newestTime);
+    _newestTime = time;
     Frame frame;
     frame.type = Frame::Type::InputReport;
-    frame.timestampNs = Util::nanosecondsFromMachTime(now);
+    frame.timestampNs = Util::nanosecondsFromMachTime(time);
     if (length > 0) frame.report.assign(data, data + length);
     appendFrame(std::move(frame));
     if (pipeline) {
-        pipeline->setTime(now);
+        pipeline->setTime(time);
         pipeline->handleInputReport(data, length);
     }
 }
@@ -159,8 +172,8 @@ bool PipelineRecording::trimIsDue() const noexcept
     if (_maxFrameCount == 0) return false;
     const std::uint64_t count = _frames.size();
     // While trims leave at most one and a half times the limit, the list is
-    // trimmed at twice the limit, as it always was: at least half a limit of
-    // appends pays for each pass. When state is written about as often as
+    // trimmed at twice the limit: at least half a limit of appends pays for
+    // each pass. When state is written about as often as
     // reports come, a trim leaves up to twice the limit, and trimming at twice
     // the limit would run its pass on every append (on the real-time thread,
     // under the pipeline lock). Then the next trim waits for the limit's

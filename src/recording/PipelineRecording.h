@@ -74,10 +74,19 @@ public:
     PipelineRecording& operator=(PipelineRecording&& other) noexcept;
     ~PipelineRecording() = default;
 
-    // PipelineInput. The recorder reads the clock itself, so setTime is ignored.
+    // PipelineInput. The recorder keeps the time line itself (it reads the
+    // clock, or takes the time a report was stamped with), so setTime is
+    // ignored; each frame's time is forwarded to the wrapped input before it.
     void setTime(std::uint64_t time) override;
     void setState(const std::string& key, PropertyValue value) override;
+    // Stamped with the clock's reading now.
     void handleInputReport(const std::uint8_t* data, std::size_t length) override;
+    // A report stamped by its device as it was read (`timeStamp` in the
+    // ticks of MonotonicClock), recorded and forwarded at that time. A
+    // report is stamped before it waits for its turn, so a state written
+    // meanwhile may already be recorded with a later time: then the report
+    // takes that time, and the recording's time line never runs backwards.
+    void handleInputReportAt(std::uint64_t timeStamp, const std::uint8_t* data, std::size_t length);
 
     // Adds a frame at the end and trims when the list has grown enough since
     // the last trim (see trimIsDue). Trimming later keeps the same frames as
@@ -143,6 +152,8 @@ private:
     std::uint64_t _maxFrameCount = 0;
     // Size of the list right after the last trim (0 before the first).
     std::uint64_t _framesKeptByLastTrim = 0;
+    // The time (ticks) of the newest frame recorded live, 0 before the first.
+    std::uint64_t _newestTime = 0;
     PlayCursor _play;
 };
 

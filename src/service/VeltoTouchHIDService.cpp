@@ -179,7 +179,7 @@ void VeltoTouchHIDService::handleInputReports(DispatchEventInfo info, HostDevice
                std::uint64_t timeStamp) {
             _log.debug("Received input report (type %ju, reportID %ju, reportLength %ju, timestampMach %ju)",
                        static_cast<std::uint32_t>(type), reportID, reportLength, timeStamp);
-            handleInputReport(report, reportLength);
+            handleInputReport(report, reportLength, timeStamp);
         });
 
     installPipelineProbes(info);
@@ -213,10 +213,13 @@ void VeltoTouchHIDService::inputReportCallback(void* context, std::int32_t, void
     reportFunction(type, static_cast<std::uint8_t>(reportID), report, reportLength, timeStamp);
 }
 
-void VeltoTouchHIDService::handleInputReport(const std::uint8_t* report, std::size_t reportLength)
+void VeltoTouchHIDService::handleInputReport(const std::uint8_t* report, std::size_t reportLength,
+                                             std::uint64_t timeStamp)
 {
     std::lock_guard<std::mutex> lock(_pipelineLock);
-    _recording.handleInputReport(report, reportLength);
+    // The device's own stamp, taken as the report was read: the recording
+    // and the pipeline see when it came, not when its turn came.
+    _recording.handleInputReportAt(timeStamp, report, reportLength);
 }
 
 void VeltoTouchHIDService::installPipelineProbes(const DispatchEventInfo& info)

@@ -79,7 +79,8 @@ private:
                                               std::uint64_t timeStamp)>;
 
     void handleInputReports(DispatchEventInfo info, VeltoHost::HostDevice::Ref device);
-    void handleInputReport(const std::uint8_t* report, std::size_t reportLength);
+    // `timeStamp`: the device's, in the ticks of the host's clock.
+    void handleInputReport(const std::uint8_t* report, std::size_t reportLength, std::uint64_t timeStamp);
     void installPipelineProbes(const DispatchEventInfo& info);
     void clearPipelineProbes();
     static void inputReportCallback(void* context, std::int32_t result, void* sender, VeltoHost::HidReportType type,

@@ -3,6 +3,7 @@
 #include "host/ControlClient.h"
 #include "PrivateBus.h"
 
+#include "platform/CaptureLogSink.h"
 #include "platform/RunLoop.h"
 #include "platform/SimulatedHostDevice.h"
 
@@ -237,4 +238,57 @@ TEST(DaemonTest, ServesSimulatedAndHotPluggedDevicesAndTakesOnlyTheConfiguredOne
     EXPECT_EQ(announced, (std::vector<std::string>{"DeviceAdded 0", "DeviceAdded 1", "DeviceAdded 2", "DeviceRemoved 2",
                                                    "DeviceAdded 3", "DeviceRemoved 0", "DeviceRemoved 1",
                                                    "DeviceRemoved 3"}));
+}
+
+TEST(DaemonTest, ASimulatedHidRecorderFilePlaysTheDeviceNamedAndOneNotInItIsLeftOut)
+{
+    PrivateBus bus;
+    ASSERT_FALSE(bus.address().empty()) << bus.error();
+    const std::string file = kExamples + "/hid-recorder-two-devices.hid";
+    const auto optionsFor = [&](std::optional<std::uint32_t> hidDevice) {
+        Daemon::Options options;
+        options.bus = BusConnection::Address::at(bus.address());
+        options.simulatedFiles = {file};
+        options.hidDevice = hidDevice;
+        options.speed = 0;
+        options.keys = false;
+        options.pluginPath = VELTO_SERVICE_MODULE_PATH;
+        return options;
+    };
+
+    // Device 1 is the surface: its tap at the top, its reset and its hold at
+    // the bottom, as replay finds them (hid-recorder-two-devices.expected).
+    {
+        ControlClient client(BusConnection::Address::at(bus.address()));
+        ASSERT_TRUE(client.connected()) << client.connectError();
+        ASSERT_TRUE(client.watchSignals());
+        Daemon daemon(optionsFor(1), nullptr);
+        std::jthread serving([&](std::stop_token stop) { daemon.run([&] { return stop.stop_requested(); }); });
+        ASSERT_TRUE(client.waitUntil([&] {
+            return client.signalsNamed("Gesture").size() == 5 && client.signalsNamed("DeviceReset").size() == 1;
+        }));
+        std::vector<std::string> gestures;
+        for (const ControlClient::Signal& signal : client.signalsNamed("Gesture")) {
+            gestures.push_back(signal.event.gesture + " " + signal.event.region);
+        }
+        EXPECT_EQ(gestures, (std::vector<std::string>{"may-begin top", "tap top", "may-begin bottom",
+                                                      "hold-start bottom", "hold-end bottom"}));
+        EXPECT_EQ(deviceNames(client), (std::vector<std::string>{"sim:" + file}));
+    }
+    // Device 0, a keyboard, is in the file too: it is played.
+    {
+        ControlClient client(BusConnection::Address::at(bus.address()));
+        ASSERT_TRUE(client.connected()) << client.connectError();
+        Daemon daemon(optionsFor(0), nullptr);
+        std::jthread serving([&](std::stop_token stop) { daemon.run([&] { return stop.stop_requested(); }); });
+        EXPECT_EQ(deviceNames(client), (std::vector<std::string>{"sim:" + file}));
+    }
+    // There is no device 2: the file is left out, and with it everything to serve.
+    CaptureLogSink::Scope log(LogLevel::Error);
+    Daemon daemon(optionsFor(2), nullptr);
+    EXPECT_EQ(daemon.run([] { return false; }), Daemon::Ending::NothingToServe);
+    const std::vector<std::string> errors = log.sink().messages("Daemon");
+    ASSERT_EQ(errors.size(), 1u);
+    EXPECT_EQ(errors[0].rfind("sim:" + file + ": not attached: ", 0), 0u) << errors[0];
+    EXPECT_NE(errors[0].find("no device 2 in it"), std::string::npos) << errors[0];
 }

@@ -1,5 +1,6 @@
 #include "platform/CaptureLogSink.h"
 #include "platform/HidrawHostDevice.h"
+#include "platform/MonotonicClock.h"
 #include "platform/RunLoop.h"
 
 #include <gtest/gtest.h>
@@ -45,14 +46,17 @@ struct Received {
     std::array<std::uint8_t, 6> buffer{};
     std::vector<std::pair<std::uint32_t, std::vector<std::uint8_t>>> reports;
     std::vector<std::thread::id> threads;
+    // Each report's time stamp, and the clock read as its callback ran.
+    std::vector<std::pair<std::uint64_t, std::uint64_t>> times;
 
     static void callback(void* context, std::int32_t, void*, HidReportType type, std::uint32_t reportID,
-                         std::uint8_t* report, std::size_t length, std::uint64_t)
+                         std::uint8_t* report, std::size_t length, std::uint64_t timeStamp)
     {
         auto* self = static_cast<Received*>(context);
         EXPECT_EQ(type, HidReportType::Input);
         self->reports.push_back({reportID, {report, report + length}});
         self->threads.push_back(std::this_thread::get_id());
+        self->times.emplace_back(timeStamp, MonotonicClock::now());
     }
 };
 
@@ -66,6 +70,7 @@ TEST(HidrawHostDeviceTest, OneReadIsOneReportAndADisappearingDeviceEndsReception
     Received received;
     std::thread::id loopThread;
 
+    const std::uint64_t beforeSending = MonotonicClock::now();
     std::thread loop([&] {
         loopThread = std::this_thread::get_id();
         ASSERT_TRUE(device.open(0));
@@ -93,6 +98,14 @@ TEST(HidrawHostDeviceTest, OneReadIsOneReportAndADisappearingDeviceEndsReception
     EXPECT_EQ(received.reports[1], (std::pair<std::uint32_t, std::vector<std::uint8_t>>{2, {2, 1, 2, 3, 4, 5}}));
     EXPECT_EQ(received.reports[2], (std::pair<std::uint32_t, std::vector<std::uint8_t>>{1, {1, 12}}));
     for (auto thread : received.threads) EXPECT_EQ(thread, loopThread);
+    // Stamped on the host's clock as each report was read, before its
+    // callback: the time the plug-in records it at.
+    std::uint64_t previous = beforeSending;
+    for (const auto& [stamp, atCallback] : received.times) {
+        EXPECT_GE(stamp, previous);
+        EXPECT_LE(stamp, atCallback);
+        previous = stamp;
+    }
 
     EXPECT_TRUE(device.isGone());
     std::vector<std::string> lines = capture.sink().messages("HostDevice");

@@ -28,16 +28,7 @@ std::string container(std::size_t reports, const std::string& end)
     return text + end;
 }
 
-struct TempFile {
-    std::unique_ptr<std::FILE, int (*)(std::FILE*)> file{std::tmpfile(), &std::fclose};
-    explicit TempFile(const std::string& text)
-    {
-        std::fwrite(text.data(), 1, text.size(), file.get());
-        std::fflush(file.get());
-        ::lseek(fd(), 0, SEEK_SET);
-    }
-    int fd() const { return ::fileno(file.get()); }
-};
+using RecordingTestSupport::TempFile;
 
 }  // namespace
 

@@ -74,9 +74,9 @@ TEST(RecordingTrim, KeepsNewestReportsAndTheStateThatStillMatters)
     }
 }
 
-// How recording used to trim: after every append that brings the list to
-// twice the limit. The recorder may trim at other moments, but what it keeps
-// must never differ from this.
+// The reference rhythm of trimming: after every append that brings the list
+// to twice the limit. The recorder may trim at other moments, but what it
+// keeps must never differ from this.
 struct TrimAtTwiceTheLimit {
     explicit TrimAtTwiceTheLimit(std::uint64_t limit) : limit(limit) {}
     void append(const Frame& frame)
@@ -112,7 +112,7 @@ TEST(RecordingTrim, KeepsWhatTrimmingAtTwiceTheLimitKeptForAnyPatternOfFrames)
     // Each row draws a frame pattern: `stateShare` in 1000 frames are state
     // writes over `keys` keys, the rest reports. Now and then the container
     // is written from a copy (the "Recording" property) or from the recorder
-    // itself (which trims it), and compared with the old rhythm's. Where
+    // itself (which trims it), and compared with the reference rhythm's. Where
     // state is rare, even the moments of trimming stay those of the old
     // rhythm (`sameMoments`: the list has the same length after every frame).
     struct Row {
@@ -249,6 +249,38 @@ TEST(Recorder, RecordsEachCallWithOneClockReadingAndForwardsIt)
     EXPECT_EQ(log->reports[0], image);
     EXPECT_TRUE(recording.frames().back().report.empty());
     EXPECT_EQ(recording.frames().back().type, Frame::Type::InputReport);
+}
+
+TEST(Recorder, RecordsAStampedReportAtItsStampAndNeverBeforeTheNewestFrame)
+{
+    auto log = std::make_shared<CallLog>();
+    PipelineRecording recording;
+    recording.pipeline = log;
+    const auto image = ReportBytes::image(1, 2);
+
+    // A stamp from the device: the frame and the forwarded time are that
+    // stamp, not a reading of the clock.
+    const std::uint64_t stamp = MonotonicClock::now() - 1000;
+    recording.handleInputReportAt(stamp, image.data(), image.size());
+    recording.handleInputReportAt(stamp + 250, image.data(), image.size());
+    // A state written while a report stamped before it waited for its turn:
+    // the report takes the state's time.
+    recording.setState("Algs.Key", PropertyValue::uint32(1));
+    const std::uint64_t stateTime = log->times.back();
+    recording.handleInputReportAt(stamp + 500, image.data(), image.size());
+
+    ASSERT_EQ(log->times.size(), 4u);
+    EXPECT_EQ(log->times[0], stamp);
+    EXPECT_EQ(log->times[1], stamp + 250);
+    EXPECT_GE(stateTime, stamp + 1000);
+    EXPECT_EQ(log->times[3], stateTime);
+    ASSERT_EQ(recording.frames().size(), 4u);
+    std::size_t i = 0;
+    for (const Frame& frame : recording.frames()) {
+        EXPECT_EQ(frame.timestampNs, VeltoTouch::Util::nanosecondsFromMachTime(log->times[i])) << "frame " << i;
+        ++i;
+    }
+    EXPECT_EQ(log->reports.size(), 3u);
 }
 
 TEST(Recorder, CopiesShareInputAndValuesButOwnTheirFramesAndNoCursor)

@@ -22,6 +22,18 @@ using VeltoTouch::PipelineRecording;
 using VeltoTouch::PropertyValue;
 using Frame = PipelineRecording::Frame;
 
+// A text in an unnamed temporary file, read from its start.
+struct TempFile {
+    std::unique_ptr<std::FILE, int (*)(std::FILE*)> file{std::tmpfile(), &std::fclose};
+    explicit TempFile(const std::string& text)
+    {
+        std::fwrite(text.data(), 1, text.size(), file.get());
+        std::fflush(file.get());
+        ::lseek(fd(), 0, SEEK_SET);
+    }
+    int fd() const { return ::fileno(file.get()); }
+};
+
 inline Frame stateFrame(std::uint64_t timestampNs, std::string key, PropertyValue value)
 {
     Frame frame;
