@@ -15,25 +15,27 @@ using VeltoHost::PropertyValue;
 PropertyValue get(Pipeline& pipeline, const std::string& key) { return pipeline.getState("Algs." + key); }
 void set(Pipeline& pipeline, const std::string& key, PropertyValue value) { pipeline.setState("Algs." + key, value); }
 
-TEST(AlgsState, NormalizationFactorsByIndex)
+// Factor N of the group table reads and writes by its index; there is none
+// past the last group, nor without an index.
+TEST(AlgsState, NormalizationFactorsReadAndWriteByIndex)
 {
     Pipeline pipeline;
     const std::string domain = "VirtualNormalizationFactors";
     EXPECT_EQ(get(pipeline, domain + ".7"), PropertyValue::float32(0.4651f));
-    EXPECT_EQ(get(pipeline, domain + ".7abc"), PropertyValue::float32(0.4651f));
-    EXPECT_EQ(get(pipeline, domain + ". 22"), PropertyValue::float32(0.6667f));
-    EXPECT_EQ(get(pipeline, domain + ".x"), PropertyValue::float32(0.6667f));
-    EXPECT_EQ(get(pipeline, domain + "."), PropertyValue::float32(0.6667f));
+    EXPECT_EQ(get(pipeline, domain + ".22"), PropertyValue::float32(0.6667f));
     EXPECT_TRUE(get(pipeline, domain + ".23").isNull());
     EXPECT_TRUE(get(pipeline, domain).isNull());
 
     set(pipeline, domain + ".7", PropertyValue::float64(0.5));
     EXPECT_EQ(get(pipeline, domain + ".7"), PropertyValue::float32(0.5f));
+    EXPECT_EQ(get(pipeline, domain + ".8"), PropertyValue::float32(0.6667f)) << "only factor 7 moved";
     // The table changes; the group's virtual pixel keeps the gain it was built with.
     EXPECT_EQ(pipeline.algs().virtualPixels[7].gain, 0.4651f);
+    // Writes past the table or without an index change nothing.
     set(pipeline, domain + ".99", PropertyValue::float64(0.5));
     set(pipeline, domain, PropertyValue::float64(0.5));
     EXPECT_EQ(get(pipeline, domain + ".0"), PropertyValue::float32(0.6667f));
+    EXPECT_TRUE(get(pipeline, domain + ".99").isNull());
 }
 
 // Every key of the table is reached by its name only (an indexed one with

@@ -68,7 +68,6 @@ TEST(ReportCommandTest, FramesLimitThePageToTheirFramesAndEvents)
     EXPECT_EQ(eventsOfPayload(payload), (std::vector<std::string>{"may-begin top 21", "tap top 32"}));
     EXPECT_EQ(payload["title"], "</script><b>{{data}}</b>");
     EXPECT_EQ(payload["facts"]["settings"], nlohmann::json::parse(R"([["Algs.HoldTimeoutMilliseconds","600"]])"));
-    EXPECT_EQ(payload["facts"]["containerVersion"], "1");
     EXPECT_EQ(html.find("<b>"), std::string::npos) << "the title reached the page unescaped";
 }
 

@@ -108,7 +108,7 @@ TEST(ServiceScheduling, ALastReleaseWhileScheduledEndsTheThreadFirst)
     }
     EXPECT_FALSE(device->isScheduled());
     EXPECT_FALSE(device->hasCallback());
-    // Reports that come now are kept by the device, not processed.
+    // Reports pushed after the last release are kept by the device, not processed.
     device->pushInputReport(ReportBytes::deviceReset());
     EXPECT_EQ(device->pendingReportCount(), 1u);
     queue->drain();

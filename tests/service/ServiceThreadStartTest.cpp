@@ -59,15 +59,12 @@ TEST(ServiceThreadStart, SchedulingFailsSoftlyAndTheServiceCanBeScheduledLater)
         InjectedStartFailures failures(1);
         ASSERT_TRUE(returns([harness] { harness->schedule(); })) << "scheduling waits for a thread that never ran";
     }
-    std::vector<std::string> errors;
+    // Said where the operator looks: an error in the log.
+    bool told = false;
     for (const LogRecord& record : capture.sink().records()) {
-        if (record.level == LogLevel::Error && record.message.rfind("pthread_setschedparam failed", 0) != 0) {
-            errors.push_back(record.category + ": " + record.message);
-        }
+        told = told || (record.level == LogLevel::Error && record.message == kThreadNotStarted);
     }
-    EXPECT_EQ(errors, (std::vector<std::string>{
-                          "Thread: cannot start thread VeltoInputReport: failure injected by failNextStarts",
-                          std::string("HIDService: ") + kThreadNotStarted}));
+    EXPECT_TRUE(told);
 
     // Nobody receives reports: the device is neither scheduled nor called.
     EXPECT_FALSE(harness->device()->isScheduled());

@@ -2,18 +2,28 @@
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
 #include <string>
 
 using namespace VeltoTool::Testing;
 
-TEST(DumpCommand, DrawsTheChosenFrames)
+// --frames picks frames out of the whole dump: each chosen frame is drawn as
+// it is there, and no other.
+TEST(DumpCommand, DrawsTheChosenFramesAsTheWholeDumpDrawsThem)
 {
-    ToolRun run = runTool({"dump", kExamples + "/taps.json", "--frames", "25:26"});
-    ASSERT_EQ(run.status, 0) << run.err;
-    EXPECT_EQ(run.out.rfind("# Image frame 25    time 1240 ms\n\n", 0), 0u);
-    EXPECT_NE(run.out.find("# Image frame 26    time 1250 ms"), std::string::npos);
-    EXPECT_EQ(run.out.find("# Image frame 27"), std::string::npos);
-    // 2 headers, 2 blank lines after them, 13 rows each, a blank line after each drawing.
-    EXPECT_EQ(std::count(run.out.begin(), run.out.end(), '\n'), 2 * (2 + 13 + 1));
+    const std::string taps = kExamples + "/taps.json";
+    for (const std::string levels : {"", "--levels"}) {
+        SCOPED_TRACE(levels);
+        std::vector<std::string> all{"dump", taps}, chosen{"dump", taps, "--frames", "25:26"};
+        if (!levels.empty()) {
+            all.push_back(levels);
+            chosen.push_back(levels);
+        }
+        const ToolRun whole = runTool(all);
+        const ToolRun part = runTool(chosen);
+        ASSERT_EQ(part.status, 0) << part.err;
+        const std::size_t from = whole.out.find("# Image frame 25 "), to = whole.out.find("# Image frame 27 ");
+        ASSERT_NE(to, std::string::npos);
+        EXPECT_EQ(part.out, whole.out.substr(from, to - from));
+        EXPECT_NE(part.out.find("# Image frame 26 "), std::string::npos);
+    }
 }

@@ -86,38 +86,6 @@ TEST(OutputFile, AnOutputThatIsAnInputIsRefusedAndTheInputKept)
     }
 }
 
-// Run as processes: a write past a file-size limit fails (File too large)
-// where an in-process run would fail nothing. Synth's own: SynthCommandTest.
-TEST(OutputFile, AFailureLeavesThePreviousOutputAndNoTemporaryFile)
-{
-    TempDir dir;
-    std::string faultyText = readFile(kExamples + "/taps.json");
-    faultyText.resize(faultyText.rfind(']'));
-    faultyText += R"(, {"Type": "Gesture", "Timestamp": 1}]})";
-    const std::string faulty = dir.file("faulty.json", faultyText).string();
-    const std::string output = dir.file("output", "previous output\n").string();
-    struct Case {
-        std::vector<std::string> arguments;
-        ProcessSetup setup;
-        std::string error;
-    };
-    const Case cases[] = {
-        {{"report", faulty, "-o", output}, {}, faulty + ": invalid frame type"},
-        {{"host", "--device", "sim:" + kExamples + "/demo.json", "--speed", "0", "--save-recording", output},
-         ProcessSetup::fileSize(64u << 10), output + ": File too large"},
-    };
-    const std::set<std::string> names = namesIn(dir.path());
-    for (const Case& c : cases) {
-        ToolProcess tool(c.arguments, c.setup);
-        ASSERT_TRUE(tool.started());
-        const ToolProcess::Result result = tool.finish(ToolProcess::Seconds(120));
-        EXPECT_EQ(result.status, 1) << c.arguments[0];
-        EXPECT_EQ(result.err, "veltotouch: " + c.error + "\n");
-        EXPECT_EQ(readFile(output), "previous output\n") << c.arguments[0];
-        EXPECT_EQ(namesIn(dir.path()), names) << c.arguments[0];
-    }
-}
-
 // A long synthesis is stopped as soon as its temporary file is there.
 TEST(OutputFile, ASignalThatEndsTheToolLeavesThePreviousOutputAndNoTemporaryFile)
 {

@@ -63,11 +63,7 @@ TEST(ReplayCommand, RecordingsThatCannotBeReadAreNamedWithWhatWasFoundInstead)
         {"empty.json", "", ": empty file, expected a recording (JSON container)"},
         {"blank.json", " \n\t\n", ": empty file (only blank space), expected a recording (JSON container)"},
         {"text.json", "not json", ": not JSON (migrateSerializedContainer failed: invalid container)"},
-        {"cut.json", "{\"Version\": 1, \"Frames\": [", ": not JSON (migrateSerializedContainer failed: invalid container)"},
         {"array.json", "[1, 2]",
-         ": JSON, but not an object at the top level, expected a recording (JSON container) "
-         "(migrateSerializedContainer failed: invalid container)"},
-        {"scalar.json", "42",
          ": JSON, but not an object at the top level, expected a recording (JSON container) "
          "(migrateSerializedContainer failed: invalid container)"},
         // The container's own messages, named with the file.
@@ -133,8 +129,6 @@ TEST(ReplayCommand, JsonLinesWithDumpsGiveOneRecordPerFrameThatAgreesWithEventsA
     for (const json& line : jsonLinesOf(dumped.out)) {
         if (line.contains("readings")) {
             ++records;
-            ASSERT_EQ(line["readings"].size(), 15u);
-            ASSERT_EQ(line["virtualLevels"].size(), 23u);
             const std::int64_t frame = line["frame"];
             if (previousFrame && frame != 0) {
                 EXPECT_GT(frame, *previousFrame);
@@ -164,6 +158,8 @@ TEST(ReplayCommand, JsonLinesWithDumpsGiveOneRecordPerFrameThatAgreesWithEventsA
     // The readable dump is pinned, frame by frame, by the examples' digests.
 }
 
+// A jump of the recording's clock is waited out only up to --max-gap, said
+// once; time stamps beyond 64 bits of nanoseconds are jumps like any other.
 TEST(ReplayCommand, PacedPlaybackShortensClockJumpsAndSaysSoOnce)
 {
     TempDir dir;
@@ -176,15 +172,11 @@ TEST(ReplayCommand, PacedPlaybackShortensClockJumpsAndSaysSoOnce)
     EXPECT_EQ(paced.err,
               "veltotouch: note: a wait of 1e+06 s between two reports is shortened to 0.001 s, as is every wait "
               "longer than that (--max-gap SECONDS sets the limit)\n");
-}
 
-TEST(ReplayCommand, TimeStampsBeyondSixtyFourBitsReplayToo)
-{
-    TempDir dir;
-    const fs::path file = dir.file("far.json", R"({"Version": 1, "Frames": [
+    const fs::path far = dir.file("far.json", R"({"Version": 1, "Frames": [
         {"Type": "InputReport", "Timestamp": 1000, "Report": "02 00 00 00 00 00 00 00 00 00 "},
         {"Type": "InputReport", "Timestamp": 1e300, "Report": "02 00 00 00 00 00 00 00 00 00 "}]})");
-    const ToolRun run = runTool({"replay", file.string(), "--jsonl", "--speed", "1", "--max-gap", "0"});
+    const ToolRun run = runTool({"replay", far.string(), "--jsonl", "--speed", "1", "--max-gap", "0"});
     ASSERT_EQ(run.status, 0) << run.err;
     EXPECT_EQ(eventsOf(run.out).size(), 2u) << run.out;
     EXPECT_NE(run.err.find("is shortened to 0 s"), std::string::npos) << run.err;

@@ -34,36 +34,26 @@ TEST(StateArguments, SettingsThePipelineConvertedAreNamedWithBothValues)
     const Case cases[] = {
         {"Algs.ActivationThreshold", "300", {}},      // an integer for a float setting
         {"Algs.ActivationThreshold", "0.1", {}},      // kept in single precision: still 0.1
-        {"Algs.ActivationThreshold", "3.4e38", {}},
         {"Algs.ActivationThreshold", "-2.5", {}},     // not range-checked, and kept as written
         {"Algs.HoldTimeoutMilliseconds", "600", {}},
-        {"Algs.HoldTimeoutMilliseconds", "600.0", {}},
         {"Algs.EnableTapSuppression", "false", {}},
         {"Algs.EnableTapSuppression", "0", {}},       // a flag written as a number
-        {"Algs.EnableHoldSuppression", "1", {}},
         {"Algs.VirtualNormalizationFactors.7", "0.5", {}},
         {"Algs.ActivationThreshold", "abc",
          "Algs.ActivationThreshold was set to a string (\"abc\") but reads back a number (0)"},
-        {"Algs.ActivationThreshold", "\"300\"",
-         "Algs.ActivationThreshold was set to a string (\"300\") but reads back a number (0)"},
         {"Algs.ActivationThreshold", "[1]", "Algs.ActivationThreshold was set to an array ([1]) but reads back a number (0)"},
         {"Algs.ActivationThreshold", "true",
          "Algs.ActivationThreshold was set to a boolean (true) but reads back a number (1)"},
         {"Algs.ActivationThreshold", "1e40", "Algs.ActivationThreshold was set to 1e+40 but reads back inf"},
-        {"Algs.ActivationThreshold", "1e-50", "Algs.ActivationThreshold was set to 1e-50 but reads back 0"},
         {"Algs.ActivationThreshold", "16777217", "Algs.ActivationThreshold was set to 16777217 but reads back 16777216"},
         {"Algs.HoldTimeoutMilliseconds", "4294967796", "Algs.HoldTimeoutMilliseconds was set to 4294967796 but reads back 500"},
         {"Algs.HoldTimeoutMilliseconds", "-1", "Algs.HoldTimeoutMilliseconds was set to -1 but reads back 4294967295"},
-        {"Algs.HoldTimeoutMilliseconds", "600.7", "Algs.HoldTimeoutMilliseconds was set to 600.7 but reads back 600"},
         {"Algs.EnableTapSuppression", "2",
          "Algs.EnableTapSuppression was set to a number (2) but reads back a boolean (true)"},
-        {"Algs.EnableHoldSuppression", "0.5",
-         "Algs.EnableHoldSuppression was set to a number (0.5) but reads back a boolean (true)"},
         {"Algs.EnableTapSuppression", "yes",
          "Algs.EnableTapSuppression was set to a string (\"yes\") but reads back a boolean (false)"},
         // Keys are exact.
         {"Algs.ActivationThreshhold", "300", "Algs.ActivationThreshhold was set to 300" + unknown},
-        {"Algs.activationthreshold", "300", "Algs.activationthreshold was set to 300" + unknown},
         {"Algs.VirtualNormalizationFactors.99", "0.5", "Algs.VirtualNormalizationFactors.99 was set to 0.5" + unknown},
     };
     for (const Case& c : cases) {
