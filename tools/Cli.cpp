@@ -9,6 +9,7 @@
 #include "FiniteNumberCheck.h"
 #include "HostCommand.h"
 #include "PropertiesCommand.h"
+#include "RecordCommand.h"
 #include "ReplayCommand.h"
 #include "ReportCommand.h"
 #include "StateArguments.h"
@@ -18,6 +19,7 @@
 #include "evaluation/CorpusShard.h"
 #include "evaluation/SweepGrid.h"
 #include "host/BusConnection.h"
+#include "host/SimulatedDevicePlayer.h"
 
 #include <CLI/CLI.hpp>
 
@@ -77,7 +79,9 @@ const CLI::Validator& settingCheck()
 const CLI::Validator& deviceCheck()
 {
     static const CLI::Validator check = argumentCheck("sim:FILE|/dev/hidrawN", [](const std::string& argument) {
-        if (argument == "sim:") throw ToolError("sim: needs a recording after the colon (sim:FILE)");
+        if (argument == VeltoHost::SimulatedDevicePlayer::kDevicePrefix) {
+            throw ToolError("sim: needs a recording after the colon (sim:FILE)");
+        }
         if (argument.empty()) throw ToolError("expected sim:FILE or /dev/hidrawN, got nothing");
     });
     return check;
@@ -254,6 +258,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
     daemonCommand->add_flag("!--no-keys", daemon.keys, "Make no virtual keyboard");
     daemonCommand->add_option("--plugin", daemon.plugin,
                               "Plug-in module to load (default: $VELTOTOUCH_PLUGIN, else the installed or built module)");
+    addHidDeviceOption(daemonCommand, daemon.hidDevice);
 
     PropertiesCommand::Options properties;
     auto* propertiesCommand =
@@ -338,6 +343,7 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
                   "Factory-reset hold duration the device reports (default 5000)");
     // Hidden from help: the uhid node elsewhere (the tests name one that is not there).
     emulateCommand->add_option("--uhid", emulate.uhidPath, "uhid node")->group("");
+    addHidDeviceOption(emulateCommand, emulate.hidDevice);
 
     ConvertCommand::Options convert;
     auto* convertCommand =
@@ -351,6 +357,24 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
         ->type_name("FORMAT")
         ->check(argumentCheck("container|hid", [](const std::string& text) { ConvertCommand::parseFormat(text); }));
     addHidDeviceOption(convertCommand, convert.hidDevice);
+
+    RecordCommand::Options record;
+    record.config = VELTO_DEFAULT_CONFIG;
+    auto* recordCommand = app.add_subcommand("record", "Capture a surface's input reports to a recording as they arrive");
+    recordCommand->add_option("DEVICE", record.device,
+                              "hidraw node (default: the first surface the configuration's [[match]] ids name)");
+    recordCommand->add_option("-o,--output", record.output, "Recording to write")->required();
+    recordCommand->add_option("--duration", record.durationSeconds,
+                              "Stop after this many seconds (default: at Ctrl-C, SIGTERM or an unplug)")
+        ->check(FiniteNumberCheck(0.001));
+    recordCommand
+        ->add_option_function<std::string>(
+            "--format", [&](const std::string& text) { record.format = ConvertCommand::parseFormat(text); },
+            "container or hid (default: hid for an output ending in .hid, else container)")
+        ->type_name("FORMAT")
+        ->check(argumentCheck("container|hid", [](const std::string& text) { ConvertCommand::parseFormat(text); }));
+    recordCommand->add_option("--config", record.config, "TOML settings whose [[match]] ids find the surface")
+        ->capture_default_str();
 
     std::string helpTopic;
     auto* helpCommand = app.add_subcommand("help", "Describe the commands, or one COMMAND and its options");
@@ -424,6 +448,8 @@ int Cli::run(int argc, const char* const* argv, std::ostream& out, std::ostream&
             return EmulateCommand::run(emulate, err);
         } else if (*convertCommand) {
             ConvertCommand::run(convert, err);
+        } else if (*recordCommand) {
+            return RecordCommand::run(record, err);
         }
     } catch (const std::exception& error) {
         err << "veltotouch: " << error.what() << '\n';

@@ -161,7 +161,7 @@ std::uint64_t playPass(Playback& playback, ToolFiles::File file)
             }
             ++played;
         },
-        playback.stopRequested);
+        playback.stopRequested, playback.options.hidDevice);
     if (stopped) throw PlaybackStopped{};
     if (played == 0) throw ToolError(playback.options.file + ": no input reports to play");
     return played;

@@ -5,6 +5,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <optional>
 #include <ostream>
 #include <string>
 
@@ -37,6 +38,9 @@ public:
         // What the factory-reset hold duration feature report carries.
         std::uint32_t holdDurationMs = kDefaultHoldDurationMs;
         std::string uhidPath = VeltoHost::UhidDevice::kDefaultPath;
+        // Of a hid-recorder file holding several devices, the one to play;
+        // empty: the one with the surface's reports.
+        std::optional<std::uint32_t> hidDevice;
     };
     using StopCheck = std::function<bool()>;
 

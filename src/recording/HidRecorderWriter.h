@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/HidrawDescription.h"
 #include "recording/PipelineRecording.h"
 
 #include <cstddef>
@@ -21,15 +22,9 @@ namespace VeltoTouch {
 // writer never throws for the stream's sake; the owner checks the stream.
 class HidRecorderWriter {
 public:
-    // What a player needs to make the device again (through uhid).
-    struct Device {
-        std::string name;
-        std::string phys;
-        std::uint32_t bus = 0;  // BUS_USB and the others of linux/input.h
-        std::uint32_t vendor = 0;
-        std::uint32_t product = 0;
-        std::vector<std::uint8_t> reportDescriptor;
-    };
+    // What a player needs to make the device again (through uhid): what a
+    // hidraw node tells of its device.
+    using Device = VeltoHost::HidrawDescription;
 
     // Writes the device's lines at once.
     HidRecorderWriter(std::ostream& out, const Device& device, std::optional<std::uint64_t> originNs = std::nullopt);

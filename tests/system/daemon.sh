@@ -23,6 +23,10 @@
 #   6. malformed reports among valid ones change nothing
 #   7. a flood of 1000 reports a second for 10 s loses no frame
 #   8. libinput sees the same keys as the evdev reader
+#   9. `veltotouch record` captures every report of a surface byte for byte,
+#      alone or beside the daemon serving it (found by the daemon's
+#      [[match]] ids), ends at an unplug, at --duration, and at SIGINT at
+#      any moment with a file that reads back
 # Each case says PASS or FAIL with what went wrong; the logs of a failed run
 # are printed at its end. The whole run takes about two minutes on this
 # 2-core machine, twice that while it is busy compiling.
@@ -698,6 +702,119 @@ check_libinput() {
     return 1
 }
 
+# ---- recordings captured by `veltotouch record`
+
+# The input reports of a recording (container, or hid-recorder text ending in
+# .hid), "LENGTH HEX..." per line, without their times.
+reports_of() {
+    local file=$1
+    if [[ $file != *.hid ]]; then
+        "$tool" convert "$file" -o "$work/reports-of.hid" --format hid >/dev/null 2>&1 || return 1
+        file=$work/reports-of.hid
+    fi
+    awk '/^E: / { $1 = ""; $2 = ""; sub(/^ +/, ""); print }' "$file"
+}
+
+# Compares the reports a capture holds with those of its source; says what differs.
+same_reports() {
+    local what=$1 expected=$2 got=$3
+    same_lines "$expected" "$got" && return 0
+    note "$what: the capture's reports differ from its source's (< source, > captured):"
+    diff "$expected" "$got" | head -n 10 | cut -c 1-120 >&2
+    return 1
+}
+
+case_record() {
+    local ok=0 source=examples/taps.json format status pid log delay
+    reports_of "$source" >"$work/record.source" || { note "case 9: convert failed"; return 1; }
+
+    # Alone on a surface no [[match]] names: record is the reader emulate
+    # waits for, so it sees every report, and the unplug at the end of the
+    # recording ends the capture.
+    for format in json hid; do
+        start_emulate "$source" --product 0x9999 --speed 4
+        wait_until 60 "the surface's hidraw node" find_hidraw 9999 || return 1
+        wait_until 60 "udev to take in $node" udev_has "$node" || return 1
+        log=$results/record-alone-$format.log
+        "${on_cpu0[@]}" "$tool" record "$node" -o "$work/alone.$format" >"$log" 2>&1
+        status=$?
+        [ $status -eq 0 ] || { note "case 9: record ($format) exited with $status: $(<"$log")"; ok=1; }
+        log_has "$log" "was removed; the recording ends there" \
+            || { note "case 9: record ($format) did not say the surface went: $(<"$log")"; ok=1; }
+        reports_of "$work/alone.$format" >"$work/alone.$format.reports"
+        same_reports "case 9, alone ($format)" "$work/record.source" "$work/alone.$format.reports" || ok=1
+        stop_emulates
+    done
+
+    # Beside the daemon, on the surface its configuration names, found by
+    # record through the same [[match]] ids. emulate plays once the daemon
+    # holds the device open, perhaps before record has it: the first report
+    # goes out alone, the others 20 s of recording (5 s at speed 4) later.
+    frames_of "$source" | awk -F '\t' 'NR == 1 { print; next } { printf "%.0f\t%s\n", $1 + 20e9, $2 }' \
+        | write_recording >"$work/record-beside.json"
+    next_device
+    start_emulate "$work/record-beside.json" --speed 4 --max-gap 30
+    local surface=$emulate_pid
+    wait_added "$n" || return 1
+    log=$results/record-beside.log
+    "${on_cpu0[@]}" "$tool" record --config "$work/veltotouch.toml" -o "$work/beside.hid" >"$log" 2>&1 &
+    pid=$!
+    wait_until 60 "record to start" log_has "$log" "veltotouch: recording" || return 1
+    find_hidraw 5678
+    log_has "$log" "recording $node " || { note "case 9: record did not find $node, the daemon's: $(<"$log")"; ok=1; }
+    wait "$surface"
+    wait "$pid"
+    status=$?
+    emulate_pids=()
+    [ $status -eq 0 ] || { note "case 9: record beside the daemon exited with $status: $(<"$log")"; ok=1; }
+    reports_of "$work/beside.hid" >"$work/beside.reports"
+    # Without the first report when record opened the device after it.
+    if ! same_lines "$work/record.source" "$work/beside.reports"; then
+        tail -n +2 "$work/record.source" >"$work/record.source-but-first"
+        same_reports "case 9, beside the daemon" "$work/record.source-but-first" "$work/beside.reports" || ok=1
+    fi
+    wait_removed "$n" || return 1
+    # The daemon served the surface all the while.
+    expect_gestures "$n" examples/taps.expected
+
+    # Ended by --duration, and by SIGINT at moments drawn at random, each
+    # leaving a file that reads back and holds a run of the source's reports.
+    start_emulate "$source" --product 0x9999 --speed 10 --loop
+    wait_until 60 "the surface's hidraw node" find_hidraw 9999 || return 1
+    wait_until 60 "udev to take in $node" udev_has "$node" || return 1
+    for format in json hid json hid duration; do
+        log=$results/record-cut-$format.log
+        if [ $format = duration ]; then
+            "${on_cpu0[@]}" "$tool" record "$node" -o "$work/cut.$format.json" --duration 1.5 >"$log" 2>&1 &
+        else
+            "${on_cpu0[@]}" "$tool" record "$node" -o "$work/cut.$format" >"$log" 2>&1 &
+        fi
+        pid=$!
+        wait_until 60 "record to start" log_has "$log" "veltotouch: recording" || return 1
+        delay=$((RANDOM % 1500))
+        if [ $format != duration ]; then
+            pause "$((delay / 1000)).$(printf %03d $((delay % 1000)))"
+            kill -INT "$pid"
+        fi
+        wait "$pid"
+        status=$?
+        local file=$work/cut.$format
+        [ $format = duration ] && file=$work/cut.$format.json
+        [ $status -eq 0 ] || { note "case 9: record ($format, stopped after $delay ms) exited with $status: $(<"$log")"; ok=1; }
+        if ! "$tool" replay "$file" >/dev/null 2>"$work/cut.err"; then
+            note "case 9: the capture ($format) stopped after $delay ms does not read back: $(<"$work/cut.err")"
+            ok=1
+            continue
+        fi
+        reports_of "$file" >"$work/cut.reports"
+        if grep -Fxvq -f "$work/record.source" "$work/cut.reports"; then
+            note "case 9: the capture ($format) stopped after $delay ms holds reports the source does not"
+            ok=1
+        fi
+    done
+    return $ok
+}
+
 run_case() {
     local title=$1 start=$SECONDS
     shift
@@ -784,6 +901,7 @@ run_case "6. malformed reports change nothing" case_malformed
 run_case "7. 1000 reports a second for 10 s, none lost" case_flood
 run_case "3. unplug mid-hold releases the key; plugged in again, taken" case_unplug
 run_case "4. two surfaces at once, each its own device, gestures and keys" case_two_surfaces
+run_case "9. record captures every report, alone or beside the daemon; a stop leaves a valid file" case_record
 
 # The daemon stops in order; ctl events then has printed all it sent.
 trace "stop"

@@ -22,32 +22,23 @@ TEST(Cli, UsageErrorsExitWithTwoAndOneLineThatNamesTheProblem)
     };
     const Case cases[] = {
         {{}, "A subcommand is required (see 'veltotouch help')"},
-        {{"frobnicate"}, "no command \"frobnicate\" (replay, synth, eval, dump, host, daemon, properties, ctl, report, emulate, convert, help)"},
+        {{"frobnicate"}, "no command \"frobnicate\" (replay, synth, eval, dump, host, daemon, properties, ctl, report, emulate, convert, record, help)"},
         {{"replay"}, "FILE is required"},
         {{"synth", "tap top"}, "--output is required"},
         {{"replay", kTaps, "--speed", "nan"}, "--speed: expected a finite number, got nan (see 'veltotouch help replay')"},
-        {{"replay", kTaps, "--speed", "inf"}, "--speed: expected a finite number, got inf"},
         {{"replay", kTaps, "--speed", "-1"}, "--speed: must be 0 or at least 0.001, got -1"},
-        {{"replay", kTaps, "--speed", "1e-9"}, "--speed: must be 0 or at least 0.001, got 1e-9"},
         {{"replay", kTaps, "--speed", "fast"}, "--speed: expected a number, got \"fast\""},
         {{"replay", kTaps, "--max-gap", "-0.5"}, "--max-gap: must be at least 0, got -0.5"},
-        {{"replay", kTaps, "--max-gap", "nan"}, "--max-gap: expected a finite number, got nan"},
         {{"replay", kTaps, "--set", "NoEquals"}, "--set: expected KEY=VALUE, got \"NoEquals\""},
-        {{"replay", kTaps, "--set", "=5"}, "--set: expected KEY=VALUE, got \"=5\""},
         {{"replay", kTaps, "--set", "Algs.HoldTimeoutMilliseconds=[1,"}, "not valid JSON"},
         {{"synth", "tap top", "-o", "/dev/null", "--frame-period", "0"}, "--frame-period: must be at least 1, got 0"},
         {{"dump", kTaps, "--frames", "x"}, "--frames: invalid frame range \"x\" (expected A:B with frame numbers)"},
-        {{"dump", kTaps, "--frames", "-1:"}, "--frames: invalid frame range \"-1:\" (expected A:B with frame numbers)"},
         {{"dump", kTaps, "--frames", "9:3"},
          "--frames: invalid frame range \"9:3\" (first frame after last) (see 'veltotouch help dump')"},
-        {{"host", "--device", "sim:" + kTaps, "--set", "Pipeline.NoEquals"}, "--set: expected KEY=VALUE"},
-        {{"host", "--device", "sim:" + kTaps, "--speed", "nan"}, "--speed: expected a finite number, got nan"},
         {{"host", "--device", "sim:"}, "--device: sim: needs a recording after the colon (sim:FILE)"},
-        {{"daemon", "--device", "sim:", "--no-udev"}, "sim: needs a recording after the colon"},
         {{"daemon", "--config", "/no/such.toml"}, "--config: File does not exist: /no/such.toml"},
         {{"ctl", "set", "NoEquals"}, "expected KEY=VALUE, got \"NoEquals\""},
         {{"ctl", "--bus", "foo", "devices"}, "\"foo\" is not a bus: give system, session or a D-Bus address"},
-        {{"daemon", "--bus", "foo", "--no-udev"}, "\"foo\" is not a bus"},
         {{"ctl", "get", "-d", "first", "Pipeline.Algs.EventStats"}, "-d"},
         {{"help", "frobnicate"}, "help: no command \"frobnicate\""},
         {{"replay", kTaps, "--check", kTaps, "--get", "DebugInfo"}, "--check compares instead of printing"},
@@ -61,7 +52,6 @@ TEST(Cli, UsageErrorsExitWithTwoAndOneLineThatNamesTheProblem)
         EXPECT_EQ(run.out, "");
         EXPECT_EQ(run.err.rfind("veltotouch: ", 0), 0u) << run.err;
         EXPECT_NE(run.err.find(c.message), std::string::npos) << run.err;
-        ASSERT_FALSE(run.err.empty());
         EXPECT_EQ(run.err.find('\n'), run.err.size() - 1) << "one line only: " << run.err;
     }
 }

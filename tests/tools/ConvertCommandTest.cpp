@@ -26,10 +26,11 @@ using Reports = std::vector<std::pair<std::uint64_t, Bytes>>;
 const std::string kTwoDevices = kExamples + "/hid-recorder-two-devices.hid";
 
 // The input reports of a recording file with their times, and how many other frames it has.
-Reports reportsIn(const std::string& path, std::size_t* others = nullptr)
+Reports reportsIn(const std::string& path, std::size_t* others = nullptr,
+                  std::optional<std::uint32_t> hidDevice = std::nullopt)
 {
     Reports reports;
-    const PipelineRecording recording = ToolFiles::readRecording(path);
+    const PipelineRecording recording = ToolFiles::readRecording(path, hidDevice);
     for (const auto& frame : recording.frames()) {
         if (frame.type == PipelineRecording::Frame::Type::InputReport) {
             reports.emplace_back(frame.timestampNs, frame.report);
@@ -171,35 +172,48 @@ TEST(ConvertCommand, AHidRecorderFilePlaysThroughEmulateAsTheDeviceItDescribes)
         }
     }
 
-    VeltoHost::Testing::FakeUhidKernel kernel;
-    kernel.send(VeltoHost::Testing::FakeUhidKernel::event(UHID_START));
-    kernel.send(VeltoHost::Testing::FakeUhidKernel::event(UHID_OPEN));
-    EmulateCommand::Options options;
-    options.file = hid;
-    options.speed = 0;
-    std::ostringstream err;
-    int status = -1;
-    std::thread emulate([&, fd = kernel.takeDeviceEnd()] {
-        try {
-            status = EmulateCommand::run(options, fd, [] { return false; }, err);
-        } catch (const ToolError& error) {
-            err << error.what();
+    // What emulate makes of a file: the creation and the input reports played.
+    const auto emulated = [](const std::string& file, std::optional<std::uint32_t> hidDevice) {
+        VeltoHost::Testing::FakeUhidKernel kernel;
+        kernel.send(VeltoHost::Testing::FakeUhidKernel::event(UHID_START));
+        kernel.send(VeltoHost::Testing::FakeUhidKernel::event(UHID_OPEN));
+        EmulateCommand::Options options;
+        options.file = file;
+        options.speed = 0;
+        options.hidDevice = hidDevice;
+        std::ostringstream err;
+        int status = -1;
+        std::thread emulate([&, fd = kernel.takeDeviceEnd()] {
+            try {
+                status = EmulateCommand::run(options, fd, [] { return false; }, err);
+            } catch (const ToolError& error) {
+                err << error.what();
+            }
+        });
+        const std::vector<uhid_event> events = kernel.receiveAll();
+        emulate.join();
+        EXPECT_EQ(status, 0) << err.str();
+        Reports played;
+        for (const uhid_event& event : events) {
+            if (event.type == UHID_INPUT2) played.emplace_back(0, Bytes(event.u.input2.data, event.u.input2.data + event.u.input2.size));
         }
-    });
-    const std::vector<uhid_event> events = kernel.receiveAll();
-    emulate.join();
-    ASSERT_EQ(status, 0) << err.str();
+        return std::pair{events, played};
+    };
+    const auto [events, played] = emulated(hid, std::nullopt);
     ASSERT_FALSE(events.empty());
     ASSERT_EQ(events.front().type, UHID_CREATE2);
     const auto& create = events.front().u.create2;
     EXPECT_EQ(reinterpret_cast<const char*>(create.name), name);
     EXPECT_EQ((std::vector<unsigned>{create.bus, create.vendor, create.product}), (std::vector<unsigned>{bus, vendor, product}));
     EXPECT_EQ(Bytes(create.rd_data, create.rd_data + create.rd_size), descriptor);
-    Reports played;
-    for (const uhid_event& event : events) {
-        if (event.type == UHID_INPUT2) played.emplace_back(0, Bytes(event.u.input2.data, event.u.input2.data + event.u.input2.size));
-    }
-    Reports recorded = reportsIn(hid);
-    for (auto& report : recorded) report.first = 0;
-    EXPECT_EQ(played, recorded);
+    const auto atZero = [](Reports reports) {
+        for (auto& report : reports) report.first = 0;
+        return reports;
+    };
+    EXPECT_EQ(played, atZero(reportsIn(hid)));
+
+    // Of a file with two devices, --hid-device picks the one played.
+    const std::string twoDevices = kExamples + "/hid-recorder-two-devices.hid";
+    EXPECT_EQ(emulated(twoDevices, std::nullopt).second, atZero(reportsIn(twoDevices)));
+    EXPECT_EQ(emulated(twoDevices, 0).second, atZero(reportsIn(twoDevices, nullptr, 0)));
 }
