@@ -137,7 +137,7 @@ std::string RecordingReport::html(const FrameSource& frames, const std::shared_p
     payload["counters"] = countersAsText(JsonValue::toJson(pipeline->getState("Algs.EventStats")));
 
     // Inside the data's script element "<" only ever stands in a string, where
-    // \u003c reads back the same and "</script>" can no longer end it early.
+    // \u003c reads back the same and "</script>" cannot end it early.
     std::string data = JsonValue::dump(payload, false);
     replaceAll(data, "<", "\\u003c");
 

@@ -59,9 +59,9 @@ TEST(HostCommandTest, AStateFrameTakesEffectBetweenTheReportsAroundItAtEverySpee
     ASSERT_NE(expected, eventsOf(runTool({"replay", kExamples + "/demo.json", "--jsonl"}).out))
         << "the setting must change what is recognised, or this test shows nothing";
 
-    // As fast as the plug-in takes reports, the write used to overtake
-    // hundreds of reports still waiting in the device; a few runs make a
-    // race that is lost now and then show.
+    // As fast as the plug-in takes reports, a write that overtook the
+    // hundreds of reports still waiting in the device would apply to them;
+    // a few runs make such a race, lost now and then, show.
     for (int run = 0; run < 3; ++run) {
         const fs::path saved = dir.file("saved.json");
         ToolRun host = runTool({"host", "--device", "sim:" + recording.string(), "--speed", "0", "--jsonl",
