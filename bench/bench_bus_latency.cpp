@@ -1,4 +1,4 @@
-// bench-libs: bus_test_support veltotouch_host
+// bench-libs: bus_test_support veltotouch_daemon
 //
 // Latency from a report entering a simulated device to the D-Bus signal it
 // causes reaching a client: the real module in a HostEventSystem (input-
@@ -16,14 +16,14 @@
 // Reports are spaced so that every thread sleeps when the next one comes, as
 // with the real device's frame rate. Percentiles are counters in microseconds.
 #include "AttachedDevice.h"
-#include "host/ControlClient.h"
 #include "PrivateBus.h"
+#include "bus/ControlClient.h"
 
-#include "host/BusService.h"
-#include "records/InputReport.h"
-#include "platform/Log.h"
-#include "platform/MonotonicClock.h"
+#include "bus/BusService.h"
+#include "platform/log/Log.h"
+#include "platform/runtime/MonotonicClock.h"
 #include "recording/PipelineRecording.h"
+#include "records/InputReport.h"
 #include "service/VeltoTouchHIDService.h"
 
 #include <benchmark/benchmark.h>

@@ -1,4 +1,4 @@
-// bench-libs: bus_test_support veltotouch_host
+// bench-libs: bus_test_support veltotouch_daemon
 //
 // What the daemon costs while nothing happens: `veltotouch daemon` with two
 // simulated devices (examples/taps.json and holds.json, played at once and
@@ -9,7 +9,7 @@
 #include "PrivateBus.h"
 #include "tools/ToolProcessSupport.h"
 
-#include "host/ControlClient.h"
+#include "bus/ControlClient.h"
 
 #include <benchmark/benchmark.h>
 

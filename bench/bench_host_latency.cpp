@@ -13,11 +13,11 @@
 //     the plug-in's work between the callback and the queue.
 // New paths reuse LatencySamples, LoopThread and reportLatency.
 
-#include "platform/MonotonicClock.h"
-#include "platform/RunLoop.h"
-#include "platform/Semaphore.h"
-#include "platform/SerialQueue.h"
-#include "platform/SimulatedHostDevice.h"
+#include "platform/devices/SimulatedHostDevice.h"
+#include "platform/runtime/MonotonicClock.h"
+#include "platform/runtime/RunLoop.h"
+#include "platform/runtime/Semaphore.h"
+#include "platform/runtime/SerialQueue.h"
 
 #include <benchmark/benchmark.h>
 

@@ -31,13 +31,13 @@
 // counters in microseconds.
 #include "ToolFiles.h"
 #include "VirtualSurface.h"
-#include "host/Gesture.h"
-#include "host/KeyMap.h"
+#include "daemon/KeyMap.h"
 #include "pipeline/Pipeline.h"
-#include "platform/Thread.h"
-#include "platform/UhidDevice.h"
-#include "records/InputReport.h"
+#include "platform/devices/UhidDevice.h"
+#include "platform/runtime/Thread.h"
 #include "recording/PipelineRecording.h"
+#include "records/Gesture.h"
+#include "records/InputReport.h"
 #include "service/VeltoTouchHIDService.h"
 
 #include <benchmark/benchmark.h>
@@ -199,7 +199,7 @@ TapRun tapRun(int rounds)
     unsigned int pressed = 0;
     pipeline.hidEventsProbe = [&](const VeltoHost::HidEventList& events) {
         for (const auto& event : events) {
-            for (const auto& action : keys.handle(VeltoHost::Gesture::of(*event))) {
+            for (const auto& action : keys.handle(VeltoTouch::Gesture::of(*event))) {
                 if (action.pressed && pressed == 0) pressed = action.code;
             }
         }

@@ -3,7 +3,7 @@
 // One Image report through the pipeline and the recogniser, debug log off,
 // on a stream that mixes idle stretches, taps, holds and a palm.
 #include "pipeline/Pipeline.h"
-#include "platform/Log.h"
+#include "platform/log/Log.h"
 
 #include <benchmark/benchmark.h>
 

@@ -12,18 +12,18 @@
 // Reports are spaced so that every thread is asleep when the next one comes,
 // as with the real device's frame rate; each benchmark runs its samples once
 // and reports percentiles as counters in microseconds.
+#include "platform/devices/HostDeviceRegistry.h"
+#include "platform/devices/SimulatedHostDevice.h"
+#include "platform/log/Log.h"
+#include "platform/log/Trace.h"
+#include "platform/runtime/MonotonicClock.h"
+#include "platform/runtime/RunLoop.h"
+#include "platform/runtime/Semaphore.h"
+#include "platform/runtime/SerialQueue.h"
+#include "platform/runtime/Thread.h"
+#include "platform/values/PropertyDictionary.h"
+#include "platform/values/PropertyValue.h"
 #include "records/InputReport.h"
-#include "platform/HostDeviceRegistry.h"
-#include "platform/Log.h"
-#include "platform/MonotonicClock.h"
-#include "platform/PropertyDictionary.h"
-#include "platform/PropertyValue.h"
-#include "platform/RunLoop.h"
-#include "platform/Semaphore.h"
-#include "platform/SerialQueue.h"
-#include "platform/SimulatedHostDevice.h"
-#include "platform/Thread.h"
-#include "platform/Trace.h"
 #include "service/VeltoTouchHIDService.h"
 
 #include <benchmark/benchmark.h>

@@ -21,14 +21,14 @@
 // little-endian), 9 string, 10 byte data (each LEN and bytes), 11 JSON text
 // (LEN and text; malformed text gives no value).
 #include "FuzzInput.h"
-#include "records/InputReport.h"
 #include "pipeline/Pipeline.h"
-#include "records/DomainKey.h"
-#include "records/Gesture.h"
-#include "platform/HidEvent.h"
-#include "platform/PropertyDictionary.h"
+#include "platform/plugin/HidEvent.h"
+#include "platform/values/PropertyDictionary.h"
 #include "recording/JsonValue.h"
 #include "recording/PipelineRecording.h"
+#include "records/DomainKey.h"
+#include "records/Gesture.h"
+#include "records/InputReport.h"
 
 #include <array>
 #include <cmath>

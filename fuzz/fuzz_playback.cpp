@@ -9,9 +9,9 @@
 #include "FuzzInput.h"
 #include "pipeline/Pipeline.h"
 #include "pipeline/PipelineInput.h"
-#include "records/TickConversion.h"
-#include "platform/MonotonicClock.h"
+#include "platform/runtime/MonotonicClock.h"
 #include "recording/PipelineRecording.h"
+#include "records/TickConversion.h"
 
 #include <cmath>
 #include <cstdio>

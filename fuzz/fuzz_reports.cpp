@@ -4,9 +4,9 @@
 // every buffer at its exact size), accept exactly the reports of their ID and
 // length, and a parsed record must encode back to the bytes it came from.
 #include "FuzzInput.h"
+#include "platform/devices/HidrawHostDevice.h"
 #include "records/FeatureReport.h"
 #include "records/InputReport.h"
-#include "platform/HidrawHostDevice.h"
 
 #include <algorithm>
 #include <cstddef>

@@ -4,8 +4,9 @@
 
 namespace VeltoTool {
 
-// The veltotouch command line: subcommands, their options, and the mapping of
-// failures to exit codes (2 for usage errors, 1 for everything else).
+// The veltotouch command line: the commands (each declares its own options,
+// see CommandLine), help, and the mapping of failures to exit codes (2 for
+// usage errors, 1 for everything else).
 class Cli {
 public:
     static int main(int argc, char** argv);

@@ -1,5 +1,6 @@
 #include "ConvertCommand.h"
 
+#include "CommandLine.h"
 #include "EmulateCommand.h"
 #include "OutputFile.h"
 #include "ToolError.h"
@@ -13,6 +14,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <memory>
 #include <stdexcept>
 #include <vector>
 
@@ -114,6 +116,25 @@ void ConvertCommand::run(const Options& options, std::ostream& err)
         err << "veltotouch: note: " << options.input << ": " << plural(leftOut, "state frame", "state frames")
             << " left out (a hid-recorder file holds input reports only)\n";
     }
+}
+
+CLI::Option* ConvertCommand::addFormat(CLI::App& command, std::optional<Format>& format, const std::string& description)
+{
+    return CommandLine::addParsed(
+        command, "--format", "FORMAT:container|hid",
+        [&format](const std::string& text) { format = parseFormat(text); }, description);
+}
+
+void ConvertCommand::addTo(CLI::App& app, int&, std::ostream&, std::ostream& err)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command = app.add_subcommand(
+        "convert", "Write a recording container as a hid-recorder text, or such a text as a container");
+    command->add_option("IN", options->input, "Recording (container, or hid-recorder text)")->required();
+    command->add_option("-o,--output", options->output, "File to write")->required();
+    addFormat(*command, options->format, "container or hid (default: the other format than IN's)");
+    CommandLine::addHidDevice(*command, options->hidDevice);
+    command->callback([options, &err] { run(*options, err); });
 }
 
 }  // namespace VeltoTool

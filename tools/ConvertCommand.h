@@ -5,6 +5,11 @@
 #include <ostream>
 #include <string>
 
+namespace CLI {
+class App;
+class Option;
+}
+
 namespace VeltoTool {
 
 // `veltotouch convert IN -o OUT`: a recording container as a hid-recorder
@@ -29,11 +34,16 @@ public:
 
     // The name on the command line: "container" or "hid". Throws ToolError.
     static Format parseFormat(const std::string& text);
+    // --format, as convert and record take it.
+    static CLI::Option* addFormat(CLI::App& command, std::optional<Format>& format, const std::string& description);
 
     // Writes OUT through OutputFile (replaced only once complete); the count
     // of frames left out goes to `err`, one line. Throws ToolError or the
     // recording's own errors.
     static void run(const Options& options, std::ostream& err);
+
+    // `convert` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

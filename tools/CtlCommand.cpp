@@ -1,16 +1,18 @@
 #include "CtlCommand.h"
 
+#include "CommandLine.h"
 #include "EventFormatter.h"
 #include "OutputFile.h"
 #include "StateArguments.h"
+#include "StopSignals.h"
 #include "ToolError.h"
-#include "host/BusService.h"
-#include "host/ControlClient.h"
-#include "host/StopSignals.h"
+#include "bus/BusService.h"
+#include "bus/ControlClient.h"
 #include "recording/JsonValue.h"
 
 #include <charconv>
 #include <chrono>
+#include <memory>
 #include <ostream>
 #include <string_view>
 #include <vector>
@@ -46,7 +48,7 @@ std::optional<unsigned> deviceNumber(std::string_view path)
 class Session {
 public:
     Session(const CtlCommand::Options& options)
-        : _options(options), _address(BusConnection::Address::parse(options.bus)), _client(_address)
+        : _options(options), _address(options.bus), _client(_address)
     {
         if (!_client.connected()) throw ToolError(_client.connectError());
     }
@@ -110,7 +112,6 @@ private:
 // need not be the one asked for.
 int watchEvents(Session& session, const CtlCommand::Options& options, std::ostream& out, std::ostream& err)
 {
-    using VeltoHost::StopSignals;
     const StopSignals stopSignals;
     ControlClient& client = session.client();
     if (!client.watchSignals()) throw ToolError("cannot watch the daemon's signals");
@@ -201,7 +202,7 @@ int CtlCommand::run(const Options& options, std::ostream& out, std::ostream& err
         return 0;
     }
     case Action::Set: {
-        const auto [key, value] = StateArguments::split(options.assignment);
+        const auto& [key, value] = options.assignment;
         const std::string path = session.devicePath();
         session.checked(client.setProperty(path, key, value), path);
         warnOfReadBack(session, path, key, value, err);
@@ -219,6 +220,42 @@ int CtlCommand::run(const Options& options, std::ostream& out, std::ostream& err
     case Action::Events: return watchEvents(session, options, out, err);
     }
     return 0;
+}
+
+void CtlCommand::addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command = app.add_subcommand("ctl", "Ask the running daemon: devices, properties, gestures, recordings");
+    CommandLine::addBus(*command, options->bus);
+    // --bus may come after the action too.
+    command->fallthrough();
+    command->require_subcommand(1);
+    const auto addAction = [&](const char* name, const char* description, Action action) {
+        CLI::App* actionCommand = command->add_subcommand(name, description);
+        actionCommand->callback([options, action] { options->action = action; });
+        if (action != Action::Devices) {
+            actionCommand->add_option("-d,--device", options->device,
+                                      "N: device number (see 'ctl devices'); default the first");
+        }
+        return actionCommand;
+    };
+    addAction("devices", "List the attached devices: number and name", Action::Devices);
+    addAction("get", "Print a property's value as JSON", Action::Get)
+        ->add_option("KEY", options->key, "Property, e.g. Pipeline.Algs.EventStats")
+        ->required();
+    CommandLine::addParsed(
+        *addAction("set", "Write a property", Action::Set), "KEY=VALUE", "TEXT:KEY=JSON",
+        [&assignment = options->assignment](const std::string& text) { assignment = StateArguments::split(text); },
+        "VALUE is JSON")
+        ->required();
+    CLI::App* events = addAction("events", "Print gestures as they happen, until interrupted (or the daemon stops)",
+                                 Action::Events);
+    events->add_flag("--jsonl", options->jsonLines, "One JSON object per line");
+    events->add_flag("--follow", options->follow, "Go on when the daemon stops, and wait for it to come back");
+    addAction("save-recording", "Write a device's recording to a file", Action::SaveRecording)
+        ->add_option("OUT", options->output, "File to write (opened here, with your rights)")
+        ->required();
+    command->callback([options, &status, &out, &err] { status = run(*options, out, err); });
 }
 
 }  // namespace VeltoTool

@@ -1,8 +1,15 @@
 #pragma once
 
+#include "bus/BusConnection.h"
+
 #include <optional>
 #include <ostream>
 #include <string>
+#include <utility>
+
+namespace CLI {
+class App;
+}
 
 namespace VeltoTool {
 
@@ -15,11 +22,11 @@ public:
     enum class Action { Devices, Get, Set, Events, SaveRecording };
 
     struct Options {
-        std::string bus = "system";      // "system", "session" or a bus address
+        VeltoHost::BusConnection::Address bus;  // the system bus unless given
         Action action = Action::Devices;
         std::optional<unsigned> device;  // empty: the first attached (Events: all)
         std::string key;                 // Get
-        std::string assignment;          // Set: KEY=VALUE
+        std::pair<std::string, std::string> assignment;  // Set: KEY and VALUE (JSON, read by the daemon)
         std::string output;              // SaveRecording
         bool jsonLines = false;          // Events
         bool follow = false;             // Events: go on across a restart of the daemon
@@ -29,6 +36,9 @@ public:
     // reached or refuses a request, and when it stops while its events are
     // watched (unless `follow`). Warnings and notices go to `err`.
     static int run(const Options& options, std::ostream& out, std::ostream& err);
+
+    // `ctl` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

@@ -1,14 +1,15 @@
 #include "DaemonCommand.h"
 
+#include "CommandLine.h"
+#include "PluginLocator.h"
+#include "StopSignals.h"
 #include "ToolError.h"
-#include "host/Daemon.h"
-#include "host/JournalLogSink.h"
-#include "host/PluginLocator.h"
-#include "host/SimulatedDevicePlayer.h"
-#include "host/StopSignals.h"
-#include "host/UdevDeviceWatcher.h"
-#include "platform/Log.h"
-#include "platform/RunLoop.h"
+#include "daemon/Daemon.h"
+#include "daemon/JournalLogSink.h"
+#include "daemon/UdevDeviceWatcher.h"
+#include "platform/log/Log.h"
+#include "platform/runtime/RunLoop.h"
+#include "recording/SimulatedDevicePlayer.h"
 
 #include <malloc.h>
 
@@ -46,7 +47,7 @@ int DaemonCommand::run(const Options& options, std::ostream& err)
     ::mallopt(M_MMAP_THRESHOLD, kLargeBlockBytes);
 
     Daemon::Options daemon;
-    daemon.bus = BusConnection::Address::parse(options.bus);
+    daemon.bus = options.bus;
     daemon.speed = options.speed;
     daemon.hidDevice = options.hidDevice;
     daemon.keys = options.keys;
@@ -76,6 +77,28 @@ int DaemonCommand::run(const Options& options, std::ostream& err)
         return kNothingToServe;
     }
     return 0;
+}
+
+void DaemonCommand::addTo(CLI::App& app, int& status, std::ostream&, std::ostream& err)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command = app.add_subcommand("daemon", "Serve touch devices on D-Bus and turn their gestures into keys");
+    command->add_option("--config", options->config, "TOML settings: devices to take, key map, log level")
+        ->check(CLI::ExistingFile);
+    CommandLine::addBus(*command, options->bus);
+    command
+        ->add_option("--device", options->devices, "sim:FILE (a recording played, then left attached) or /dev/hidrawN")
+        ->check(CommandLine::deviceCheck());
+    command
+        ->add_option("--speed", options->speed, "Simulated devices: play S times faster than recorded (0: at once)")
+        ->capture_default_str()
+        ->check(CommandLine::speedCheck());
+    command->add_flag("!--no-udev", options->udev, "Take no device by itself, only those given with --device");
+    command->add_flag("!--no-keys", options->keys, "Make no virtual keyboard");
+    command->add_option("--plugin", options->plugin,
+                        "Plug-in module to load (default: $VELTOTOUCH_PLUGIN, else the installed or built module)");
+    CommandLine::addHidDevice(*command, options->hidDevice);
+    command->callback([options, &status, &err] { status = run(*options, err); });
 }
 
 }  // namespace VeltoTool

@@ -1,10 +1,16 @@
 #pragma once
 
+#include "bus/BusConnection.h"
+
 #include <cstdint>
 #include <optional>
 #include <ostream>
 #include <string>
 #include <vector>
+
+namespace CLI {
+class App;
+}
 
 namespace VeltoTool {
 
@@ -16,7 +22,7 @@ class DaemonCommand {
 public:
     struct Options {
         std::string config;                // TOML file; empty: built-in defaults
-        std::string bus = "system";        // "system", "session" or a bus address
+        VeltoHost::BusConnection::Address bus;  // the system bus unless given
         std::vector<std::string> devices;  // sim:FILE or /dev/hidrawN
         double speed = 1.0;
         // Of a sim:FILE that is a hid-recorder text of several devices, the
@@ -37,6 +43,9 @@ public:
     // with its reason on err); throws ToolError (or the readers' errors) for
     // what keeps the service from starting or running: no bus, the bus lost.
     static int run(const Options& options, std::ostream& err);
+
+    // `daemon` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

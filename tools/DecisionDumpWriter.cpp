@@ -2,8 +2,8 @@
 
 #include "algs/DecisionDump.h"
 #include "algs/VirtualImage.h"
-#include "host/GestureFields.h"
-#include "platform/PropertyDictionary.h"
+#include "bus/GestureFields.h"
+#include "platform/values/PropertyDictionary.h"
 #include "recording/JsonValue.h"
 
 #include <charconv>

@@ -1,12 +1,14 @@
 #include "DumpCommand.h"
 
+#include "CommandLine.h"
+#include "ImageDrawing.h"
 #include "ToolError.h"
 #include "ToolFiles.h"
-#include "records/InputReport.h"
-#include "ImageDrawing.h"
 #include "recording/PipelineRecording.h"
+#include "records/InputReport.h"
 
 #include <charconv>
+#include <memory>
 
 namespace VeltoTool {
 
@@ -43,14 +45,27 @@ DumpCommand::FrameRange DumpCommand::parseRange(const std::string& text)
 
 void DumpCommand::run(const Options& options, std::ostream& out)
 {
-    const FrameRange range = parseRange(options.frames);
     const VeltoTouch::PipelineRecording recording = ToolFiles::readRecording(options.file, options.hidDevice);
     for (const auto& frame : recording.frames()) {
         if (frame.type != VeltoTouch::PipelineRecording::Frame::Type::InputReport) continue;
         auto image = VeltoTouch::InputReport::Image::parse(frame.report.data(), frame.report.size());
-        if (!image || !range.contains(image->frameNumber)) continue;
+        if (!image || !options.frames.contains(image->frameNumber)) continue;
         out << VeltoTouch::Util::stringFromImage(*image, options.levels) << '\n';
     }
+}
+
+void DumpCommand::addTo(CLI::App& app, int&, std::ostream& out, std::ostream&)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command = app.add_subcommand("dump", "Draw each Image report of a recording over the pad layout");
+    command->add_option("FILE", options->file, "Recording (container, or hid-recorder text)")->required();
+    CommandLine::addParsed(
+        *command, "--frames", "TEXT:A:B",
+        [&frames = options->frames](const std::string& text) { frames = parseRange(text); },
+        "A:B, inclusive range of frame numbers (either side may be left out)");
+    command->add_flag("--levels", options->levels, "Draw the levels instead of the readings");
+    CommandLine::addHidDevice(*command, options->hidDevice);
+    command->callback([options, &out] { run(*options, out); });
 }
 
 }  // namespace VeltoTool

@@ -1,14 +1,16 @@
 #include "EmulateCommand.h"
 
+#include "CommandLine.h"
+#include "FiniteNumberCheck.h"
+#include "StopSignals.h"
 #include "ToolError.h"
 #include "ToolFiles.h"
 #include "VirtualSurface.h"
-#include "host/GapCap.h"
-#include "host/StopSignals.h"
-#include "platform/UhidDevice.h"
+#include "platform/devices/UhidDevice.h"
+#include "recording/GapCap.h"
+#include "recording/PipelineRecording.h"
 #include "records/FeatureReport.h"
 #include "records/LittleEndian.h"
-#include "recording/PipelineRecording.h"
 #include "service/VeltoTouchHIDService.h"
 
 #include <linux/input.h>
@@ -18,6 +20,7 @@
 #include <charconv>
 #include <chrono>
 #include <cstdio>
+#include <memory>
 #include <optional>
 #include <vector>
 
@@ -196,13 +199,13 @@ UhidDevice::FeatureReportSource featureReports(const EmulateCommand::Options& op
 int EmulateCommand::run(const Options& options, std::ostream& err)
 {
     // Before any slow work: a stop from here on removes the device in order.
-    VeltoHost::StopSignals signals;
+    StopSignals signals;
     ToolFiles::File recording = ToolFiles::openRecording(options.file);
     std::string error;
     const int fd = UhidDevice::openNode(options.uhidPath, error);
     if (fd < 0) throw ToolError(error);
     UhidDevice device(fd, featureReports(options));
-    return emulate(options, std::move(recording), device, &VeltoHost::StopSignals::requested, err);
+    return emulate(options, std::move(recording), device, &StopSignals::requested, err);
 }
 
 int EmulateCommand::run(const Options& options, int uhidFd, const StopCheck& stopRequested, std::ostream& err)
@@ -227,6 +230,42 @@ std::uint32_t EmulateCommand::parseNumber(const std::string& text, std::uint32_t
         throw ToolError("must be at most " + std::string(bound) + ", got " + text);
     }
     return static_cast<std::uint32_t>(number);
+}
+
+void EmulateCommand::addTo(CLI::App& app, int& status, std::ostream&, std::ostream& err)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command =
+        app.add_subcommand("emulate", "Make a virtual surface through /dev/uhid and play a recording into it");
+    command->add_option("FILE", options->file, "Recording (container, or hid-recorder text)")->required();
+    // Ids and durations as the daemon's configuration writes them: 0xHEX or decimal.
+    const auto addNumber = [&](const char* name, const char* type, std::uint32_t largest, auto& target,
+                               const char* description) {
+        CommandLine::addParsed(
+            *command, name, type,
+            [&target, largest](const std::string& text) {
+                target = static_cast<std::remove_reference_t<decltype(target)>>(parseNumber(text, largest));
+            },
+            description);
+    };
+    addNumber("--vendor", "ID", 0xFFFF, options->vendor, "USB vendor id, 0xHEX or decimal (default 0x1234)");
+    addNumber("--product", "ID", 0xFFFF, options->product, "USB product id (default 0x5678)");
+    command
+        ->add_option("--speed", options->speed,
+                     "Play S times faster than recorded, S at least 0.001 (0: as fast as the kernel takes the reports)")
+        ->capture_default_str()
+        ->check(CommandLine::speedCheck());
+    command
+        ->add_option("--max-gap", options->maxGapSeconds, "Wait at most this many seconds for one gap between reports")
+        ->check(FiniteNumberCheck(0))
+        ->capture_default_str();
+    command->add_flag("--loop", options->loop, "Play the recording again and again until interrupted");
+    addNumber("--hold-duration", "MS", 0xFFFFFFFF, options->holdDurationMs,
+              "Factory-reset hold duration the device reports (default 5000)");
+    // Hidden from help: the uhid node elsewhere (the tests name one that is not there).
+    command->add_option("--uhid", options->uhidPath, "uhid node")->group("");
+    CommandLine::addHidDevice(*command, options->hidDevice);
+    command->callback([options, &status, &err] { status = run(*options, err); });
 }
 
 }  // namespace VeltoTool

@@ -1,13 +1,17 @@
 #pragma once
 
-#include "host/GapCap.h"
-#include "platform/UhidDevice.h"
+#include "platform/devices/UhidDevice.h"
+#include "recording/GapCap.h"
 
 #include <cstdint>
 #include <functional>
 #include <optional>
 #include <ostream>
 #include <string>
+
+namespace CLI {
+class App;
+}
 
 namespace VeltoTool {
 
@@ -56,6 +60,9 @@ public:
     // A vendor or product id, or a hold duration: decimal, or hexadecimal
     // after 0x, not above `largest`. Throws ToolError.
     static std::uint32_t parseNumber(const std::string& text, std::uint32_t largest);
+
+    // `emulate` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

@@ -1,12 +1,11 @@
 #include "EvalCommand.h"
 
+#include "CommandLine.h"
 #include "StateArguments.h"
 #include "ToolError.h"
 #include "ToolFiles.h"
 #include "evaluation/CorpusEvaluator.h"
-#include "evaluation/CorpusShard.h"
 #include "evaluation/EvaluationReport.h"
-#include "evaluation/SweepGrid.h"
 #include "pipeline/Pipeline.h"
 #include "recording/JsonValue.h"
 
@@ -16,6 +15,7 @@
 #include <algorithm>
 #include <cstdio>
 #include <iostream>
+#include <memory>
 #include <set>
 #include <sstream>
 
@@ -73,8 +73,7 @@ PipelineSettings settingsOf(const EvalCommand::Options& options, std::ostream& e
     VeltoTouch::Pipeline pipeline;
     StateArguments::apply(pipeline, options.settings, err);
     PipelineSettings settings;
-    for (const auto& [key, text] : options.settings) {
-        const VeltoHost::PropertyValue value = StateArguments::parseValue(key, text);
+    for (const auto& [key, text, value] : options.settings) {
         settings.push_back({key, nlohmann::json::parse(VeltoTouch::JsonValue::toJson(value).dump())});
     }
     return settings;
@@ -233,7 +232,7 @@ private:
 int EvalCommand::run(const Options& options, std::ostream& out, std::ostream& err)
 {
     if (options.merge) {
-        if (!options.sweeps.empty() || !options.settings.empty() || !options.shard.empty() || options.truth != "auto") {
+        if (!options.sweeps.empty() || !options.settings.empty() || options.shard || options.truth != "auto") {
             err << "veltotouch: eval --merge adds up reports; --sweep, --set, --shard and --truth do not apply\n";
             return kUsageError;
         }
@@ -247,14 +246,10 @@ int EvalCommand::run(const Options& options, std::ostream& out, std::ostream& er
 
     EvaluationReport report;
     report.settings = settingsOf(options, err);
-    std::vector<VeltoTouch::SweepGrid::Axis> axes;
-    for (const std::string& sweep : options.sweeps) {
-        axes.push_back(VeltoTouch::SweepGrid::parseAxis(sweep));
-        report.sweepKeys.push_back(axes.back().key);
-    }
+    for (const VeltoTouch::SweepGrid::Axis& axis : options.sweeps) report.sweepKeys.push_back(axis.key);
     std::vector<PipelineSettings> grid;
     try {
-        grid = VeltoTouch::SweepGrid::combinations(axes);
+        grid = VeltoTouch::SweepGrid::combinations(options.sweeps);
     } catch (const std::invalid_argument& error) {
         // Each axis was checked with the command line; only their product is
         // left, and it is as much a usage error as one axis too long.
@@ -262,8 +257,7 @@ int EvalCommand::run(const Options& options, std::ostream& out, std::ostream& er
         return kUsageError;
     }
 
-    const VeltoTouch::CorpusShard shard =
-        options.shard.empty() ? VeltoTouch::CorpusShard{} : VeltoTouch::CorpusShard::parse(options.shard);
+    const VeltoTouch::CorpusShard shard = options.shard.value_or(VeltoTouch::CorpusShard{});
     std::vector<CorpusEvaluator::Item> corpus;
     for (std::size_t i = 0; i < options.files.size(); ++i) {
         if (!shard.contains(i)) continue;
@@ -295,6 +289,34 @@ int EvalCommand::run(const Options& options, std::ostream& out, std::ostream& er
     for (std::size_t i = 0; i < grid.size(); ++i) report.rows.push_back({grid[i], results[i]});
     print(report, options.json, out);
     return 0;
+}
+
+void EvalCommand::addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command =
+        app.add_subcommand("eval", "Measure the recogniser on synthesised recordings against their truth");
+    command->add_option("FILE", options->files, "Recordings (with --merge: reports of eval --json)")->required();
+    command->add_option("--truth", options->truth, "auto (FILE with its extension replaced by .truth.jsonl) or PATH")
+        ->capture_default_str();
+    CommandLine::addSettings(*command, options->settings,
+                             "KEY=VALUE: pipeline state before each replay (VALUE is JSON)");
+    CommandLine::addParsed<std::vector<std::string>>(
+        *command, "--sweep", "TEXT:KEY=FROM:TO:STEP",
+        [&sweeps = options->sweeps](const std::string& text) {
+            sweeps.push_back(VeltoTouch::SweepGrid::parseAxis(text));
+        },
+        "KEY=FROM:TO:STEP: evaluate once per value (repeat for a grid)");
+    command->add_option("-j,--jobs", options->workers, "Worker threads (default: all cores)")
+        ->check(CLI::Range(1u, 1024u));
+    CommandLine::addParsed(
+        *command, "--shard", "TEXT:I/N",
+        [&shard = options->shard](const std::string& text) { shard = VeltoTouch::CorpusShard::parse(text); },
+        "I/N: only every N-th recording, starting at I (0 <= I < N)");
+    command->add_flag("--merge", options->merge, "FILEs are reports of eval --json (shards); print them added up");
+    command->add_flag("--json", options->json, "One JSON document instead of tables");
+    CommandLine::addHidDevice(*command, options->hidDevice);
+    command->callback([options, &status, &out, &err] { status = run(*options, out, err); });
 }
 
 }  // namespace VeltoTool

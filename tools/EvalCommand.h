@@ -1,11 +1,18 @@
 #pragma once
 
+#include "StateArguments.h"
+#include "evaluation/CorpusShard.h"
+#include "evaluation/SweepGrid.h"
+
 #include <cstdint>
 #include <optional>
 #include <ostream>
 #include <string>
-#include <utility>
 #include <vector>
+
+namespace CLI {
+class App;
+}
 
 namespace VeltoTool {
 
@@ -21,14 +28,14 @@ public:
         // "auto" (TruthRecord::pathBeside of each recording) or one truth file
         // for a single recording.
         std::string truth = "auto";
-        // KEY and JSON text, applied before every replay.
-        std::vector<std::pair<std::string, std::string>> settings;
-        // KEY=FROM:TO:STEP each.
-        std::vector<std::string> sweeps;
+        // Applied before every replay.
+        std::vector<StateArguments::Setting> settings;
+        // One axis of the grid each.
+        std::vector<VeltoTouch::SweepGrid::Axis> sweeps;
         // 0: all cores.
         unsigned workers = 0;
-        // "I/N" or empty.
-        std::string shard;
+        // Empty: every recording.
+        std::optional<VeltoTouch::CorpusShard> shard;
         bool merge = false;
         bool json = false;
         // Of a hid-recorder file holding several devices, the one to read;
@@ -40,6 +47,9 @@ public:
     // sweep grid beyond its limit, 0 otherwise; throws ToolError (or the
     // recording's error) on failure.
     static int run(const Options& options, std::ostream& out, std::ostream& err);
+
+    // `eval` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

@@ -1,8 +1,8 @@
 #include "EventFormatter.h"
 
-#include "host/GestureFields.h"
-#include "records/TickConversion.h"
+#include "bus/GestureFields.h"
 #include "recording/JsonValue.h"
+#include "records/TickConversion.h"
 
 #include <nlohmann/json.hpp>
 

@@ -1,8 +1,8 @@
 #pragma once
 
-#include "host/GestureFields.h"
-#include "platform/HidEvent.h"
-#include "platform/PropertyValue.h"
+#include "bus/GestureFields.h"
+#include "platform/plugin/HidEvent.h"
+#include "platform/values/PropertyValue.h"
 
 #include <cstdint>
 #include <optional>

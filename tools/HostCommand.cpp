@@ -1,20 +1,22 @@
 #include "HostCommand.h"
 
+#include "CommandLine.h"
 #include "EventFormatter.h"
+#include "FiniteNumberCheck.h"
 #include "OutputFile.h"
+#include "PluginLocator.h"
 #include "StateArguments.h"
+#include "StopSignals.h"
 #include "ToolError.h"
 #include "ToolFiles.h"
-#include "host/PluginLocator.h"
-#include "host/SimulatedDevicePlayer.h"
-#include "host/StopSignals.h"
-#include "platform/HidrawHostDevice.h"
-#include "platform/HidrawNode.h"
-#include "platform/HostEventSystem.h"
-#include "platform/MonotonicClock.h"
-#include "platform/PropertyDictionary.h"
-#include "platform/SimulatedHostDevice.h"
+#include "platform/devices/HidrawHostDevice.h"
+#include "platform/devices/HidrawNode.h"
+#include "platform/devices/SimulatedHostDevice.h"
+#include "platform/plugin/HostEventSystem.h"
+#include "platform/runtime/MonotonicClock.h"
+#include "platform/values/PropertyDictionary.h"
 #include "recording/PipelineRecording.h"
+#include "recording/SimulatedDevicePlayer.h"
 
 #include <cerrno>
 #include <chrono>
@@ -28,7 +30,6 @@ using VeltoHost::HostEventSystem;
 using VeltoHost::MonotonicClock;
 using VeltoHost::PropertyValue;
 using VeltoHost::SimulatedHostDevice;
-using VeltoHost::StopSignals;
 using VeltoTouch::PipelineRecording;
 
 namespace {
@@ -93,10 +94,7 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
     // Before any slow work: a stop from here on ends the run in order.
     StopSignals signals;
 
-    const std::string plugin = VeltoHost::PluginLocator::chosenOrFound(options.plugin);
-    std::vector<std::pair<std::string, PropertyValue>> settings;
-    for (const auto& [key, text] : options.settings) settings.emplace_back(key, StateArguments::parseValue(key, text));
-
+    const std::string plugin = PluginLocator::chosenOrFound(options.plugin);
     Device device = openDevice(options.device);
     // Opened before the first report: a session is never played only to find
     // at the end that its recording cannot be saved, or that saving it would
@@ -116,7 +114,7 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
     });
     host.start(plugin, kFactoryName, device.device);
 
-    for (const auto& [key, value] : settings) {
+    for (const auto& [key, text, value] : options.settings) {
         if (!host.setProperty(key, value)) {
             err << "veltotouch: property " << key << " was not taken\n";
         } else if (auto warning = StateArguments::readBackWarning(key, value, host.copyProperty(key))) {
@@ -187,6 +185,34 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
         return 1;
     }
     return 0;
+}
+
+void HostCommand::addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command = app.add_subcommand("host", "Run the plug-in in the host against a simulated or a real device");
+    command->add_option("--device", options->device, "sim:FILE (a recording played as a device) or /dev/hidrawN")
+        ->required()
+        ->check(CommandLine::deviceCheck());
+    command->add_option("--plugin", options->plugin,
+                        "Plug-in module to load (default: $VELTOTOUCH_PLUGIN, else the installed or built module)");
+    command->add_option("--speed", options->speed, "Simulated device: play S times faster than recorded")
+        ->capture_default_str()
+        ->check(CommandLine::speedCheck());
+    CommandLine::addSettings(*command, options->settings,
+                             "Pipeline.KEY=VALUE: property to write before reports flow (VALUE is JSON)");
+    command
+        ->add_option("--max-gap", options->maxGapSeconds,
+                     "Simulated device: wait at most this many seconds for one gap between reports")
+        ->check(FiniteNumberCheck(0))
+        ->capture_default_str();
+    command->add_option("--get", options->reads, "KEY: property to read at the end");
+    command->add_option("--save-recording", options->saveRecording,
+                        "Write the plug-in's \"Recording\" property here at the end");
+    command->add_flag("--jsonl", options->jsonLines, "One JSON object per line");
+    command->add_flag("--summary", options->summary, "Print the gesture counters at the end");
+    CommandLine::addHidDevice(*command, options->hidDevice);
+    command->callback([options, &status, &out, &err] { status = run(*options, out, err); });
 }
 
 }  // namespace VeltoTool

@@ -1,13 +1,17 @@
 #pragma once
 
-#include "host/GapCap.h"
+#include "StateArguments.h"
+#include "recording/GapCap.h"
 
 #include <cstdint>
 #include <optional>
 #include <ostream>
 #include <string>
-#include <utility>
 #include <vector>
+
+namespace CLI {
+class App;
+}
 
 namespace VeltoTool {
 
@@ -27,7 +31,7 @@ public:
         double speed = 1.0;
         double maxGapSeconds = VeltoHost::GapCap::kDefaultMaxSeconds;
         // Properties written before reports flow ("Pipeline.Algs.HoldTimeoutMilliseconds" and a JSON value).
-        std::vector<std::pair<std::string, std::string>> settings;
+        std::vector<StateArguments::Setting> settings;
         std::vector<std::string> reads;
         std::string saveRecording;
         bool jsonLines = false;
@@ -39,6 +43,9 @@ public:
 
     // Returns the exit status; throws ToolError for what the user can fix.
     static int run(const Options& options, std::ostream& out, std::ostream& err);
+
+    // `host` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

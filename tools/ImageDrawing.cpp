@@ -1,6 +1,6 @@
 #include "ImageDrawing.h"
 
-#include "platform/LogFormat.h"
+#include "platform/log/LogFormat.h"
 
 #include <array>
 #include <cassert>

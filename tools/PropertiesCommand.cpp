@@ -1,5 +1,6 @@
 #include "PropertiesCommand.h"
 
+#include "CommandLine.h"
 #include "algs/Algs.h"
 #include "pipeline/Pipeline.h"
 #include "recording/JsonValue.h"
@@ -7,6 +8,7 @@
 
 #include <algorithm>
 #include <iomanip>
+#include <memory>
 
 namespace VeltoTool {
 
@@ -98,6 +100,15 @@ void PropertiesCommand::run(const Options& options, std::ostream& out)
         if (!property.defaultValue.empty()) out << " (default " << property.defaultValue << ")";
         out << '\n';
     }
+}
+
+void PropertiesCommand::addTo(CLI::App& app, int&, std::ostream& out, std::ostream&)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command =
+        app.add_subcommand("properties", "List every property of the plug-in: type, access, default and meaning");
+    command->add_flag("--markdown", options->markdown, "As a Markdown document (docs/properties.md)");
+    command->callback([options, &out] { run(*options, out); });
 }
 
 }  // namespace VeltoTool

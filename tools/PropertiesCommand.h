@@ -4,6 +4,10 @@
 #include <string>
 #include <vector>
 
+namespace CLI {
+class App;
+}
+
 namespace VeltoTool {
 
 // `veltotouch properties [--markdown]`: every property of the plug-in, the
@@ -27,6 +31,9 @@ public:
     static std::vector<Property> properties();
 
     static void run(const Options& options, std::ostream& out);
+
+    // `properties` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

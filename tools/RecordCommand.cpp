@@ -1,14 +1,16 @@
 #include "RecordCommand.h"
 
+#include "CommandLine.h"
+#include "FiniteNumberCheck.h"
 #include "OutputFile.h"
+#include "StopSignals.h"
 #include "ToolError.h"
-#include "host/DaemonConfig.h"
-#include "host/StopSignals.h"
-#include "host/UdevDeviceWatcher.h"
-#include "platform/HidrawDescription.h"
-#include "platform/HidrawNode.h"
-#include "platform/MonotonicClock.h"
-#include "platform/RunLoop.h"
+#include "daemon/DaemonConfig.h"
+#include "daemon/UdevDeviceWatcher.h"
+#include "platform/devices/HidrawDescription.h"
+#include "platform/devices/HidrawNode.h"
+#include "platform/runtime/MonotonicClock.h"
+#include "platform/runtime/RunLoop.h"
 #include "recording/ContainerWriter.h"
 #include "recording/HidRecorderWriter.h"
 #include "records/TickConversion.h"
@@ -154,8 +156,8 @@ int RecordCommand::run(const Options& options, std::ostream& err)
 {
     // Installed before the output exists: a stop ends the capture and keeps
     // it, rather than removing the unfinished file.
-    VeltoHost::StopSignals signals;
-    return run(options, &VeltoHost::StopSignals::requested, err);
+    StopSignals signals;
+    return run(options, &StopSignals::requested, err);
 }
 
 int RecordCommand::run(const Options& options, const StopCheck& stopRequested, std::ostream& err)
@@ -221,6 +223,26 @@ int RecordCommand::run(const Options& options, const StopCheck& stopRequested, s
     err << "veltotouch: recorded " << reports << (reports == 1 ? " input report" : " input reports") << " in "
         << seconds(tookNs) << " to " << options.output << std::endl;
     return readError ? 1 : 0;
+}
+
+void RecordCommand::addTo(CLI::App& app, int& status, std::ostream&, std::ostream& err)
+{
+    auto options = std::make_shared<Options>();
+    options->config = VELTO_DEFAULT_CONFIG;
+    CLI::App* command =
+        app.add_subcommand("record", "Capture a surface's input reports to a recording as they arrive");
+    command->add_option("DEVICE", options->device,
+                        "hidraw node (default: the first surface the configuration's [[match]] ids name)");
+    command->add_option("-o,--output", options->output, "Recording to write")->required();
+    command
+        ->add_option("--duration", options->durationSeconds,
+                     "Stop after this many seconds (default: at Ctrl-C, SIGTERM or an unplug)")
+        ->check(FiniteNumberCheck(0.001));
+    ConvertCommand::addFormat(*command, options->format,
+                              "container or hid (default: hid for an output ending in .hid, else container)");
+    command->add_option("--config", options->config, "TOML settings whose [[match]] ids find the surface")
+        ->capture_default_str();
+    command->callback([options, &status, &err] { status = run(*options, err); });
 }
 
 }  // namespace VeltoTool

@@ -7,6 +7,10 @@
 #include <ostream>
 #include <string>
 
+namespace CLI {
+class App;
+}
+
 namespace VeltoTool {
 
 // `veltotouch record [DEVICE] -o FILE`: captures every input report a surface
@@ -42,6 +46,9 @@ public:
     // The first hidraw node (by number) whose ids one of the configuration's
     // [[match]] tables names, found through udev. Throws ToolError.
     static std::string findSurface(const std::string& config);
+
+    // `record` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

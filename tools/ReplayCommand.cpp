@@ -1,12 +1,14 @@
 #include "ReplayCommand.h"
 
+#include "CommandLine.h"
 #include "DecisionDumpWriter.h"
 #include "EventFormatter.h"
+#include "FiniteNumberCheck.h"
 #include "ReplayCheck.h"
 #include "StateArguments.h"
 #include "ToolFiles.h"
 #include "pipeline/Pipeline.h"
-#include "platform/MonotonicClock.h"
+#include "platform/runtime/MonotonicClock.h"
 #include "recording/JsonValue.h"
 #include "recording/PipelineRecording.h"
 
@@ -94,6 +96,41 @@ int ReplayCommand::run(const Options& options, std::ostream& out, std::ostream& 
     }
     out << options.file << ": " << check->summary() << '\n';
     return 0;
+}
+
+void ReplayCommand::addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command =
+        app.add_subcommand("replay", "Play a recording through a fresh pipeline and print its gestures");
+    command->add_option("FILE", options->file, "Recording (container, or hid-recorder text)")->required();
+    command
+        ->add_option("--speed", options->speed,
+                     "Pace like the recording, S times faster, S at least 0.001 (default 0: as fast as possible)")
+        ->check(CommandLine::speedCheck());
+    command
+        ->add_option("--max-gap", options->maxGapSeconds,
+                     "When paced, wait at most this many seconds for one gap between reports")
+        ->check(FiniteNumberCheck(0))
+        ->capture_default_str();
+    CommandLine::addSettings(*command, options->settings,
+                             "KEY=VALUE: pipeline state before the first frame (VALUE is JSON)");
+    command->add_option("--get", options->reads, "KEY: pipeline state to print after the last frame");
+    command->add_flag("--dump", options->dump,
+                      "Print the recogniser's per-frame descriptions (with --jsonl: its record of each frame)");
+    command->add_flag("--jsonl", options->jsonLines, "One JSON object per line");
+    command->add_option("--check", options->check,
+                        "EXPECTED: compare the events (and the values it holds) with this file of --jsonl lines "
+                        "instead of printing them; exit 1 at the first difference");
+    CommandLine::addHidDevice(*command, options->hidDevice);
+    command->callback([options, &status, &out, &err] {
+        // Said here rather than with CLI11's excludes, whose help lists the
+        // excluded options in no fixed order.
+        if (!options->check.empty() && (options->jsonLines || options->dump || !options->reads.empty())) {
+            throw CLI::ValidationError("--check compares instead of printing: it takes no --jsonl, --dump or --get");
+        }
+        status = run(*options, out, err);
+    });
 }
 
 }  // namespace VeltoTool

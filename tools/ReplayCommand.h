@@ -1,13 +1,17 @@
 #pragma once
 
-#include "host/GapCap.h"
+#include "StateArguments.h"
+#include "recording/GapCap.h"
 
 #include <cstdint>
 #include <optional>
 #include <ostream>
 #include <string>
-#include <utility>
 #include <vector>
+
+namespace CLI {
+class App;
+}
 
 namespace VeltoTool {
 
@@ -23,7 +27,7 @@ public:
         double maxGapSeconds = VeltoHost::GapCap::kDefaultMaxSeconds;
         // Pipeline state applied before the first frame: key relative to the
         // pipeline ("Algs.HoldTimeoutMilliseconds") and a JSON value.
-        std::vector<std::pair<std::string, std::string>> settings;
+        std::vector<StateArguments::Setting> settings;
         // Pipeline state read after the last frame.
         std::vector<std::string> reads;
         bool dump = false;
@@ -41,6 +45,9 @@ public:
     // With a check, one line: the verdict to `out`, or the first difference
     // to `err` and exit status 1. Throws ToolError or the recording's own errors.
     static int run(const Options& options, std::ostream& out, std::ostream& err);
+
+    // `replay` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

@@ -1,6 +1,6 @@
 #include "ReportCommand.h"
 
-#include "DumpCommand.h"
+#include "CommandLine.h"
 #include "OutputFile.h"
 #include "StateArguments.h"
 #include "ToolFiles.h"
@@ -18,10 +18,9 @@ using VeltoTouch::RecordingReport;
 void ReportCommand::run(const Options& options, std::ostream& err)
 {
     RecordingReport::Options report;
-    if (!options.frames.empty()) {
-        const DumpCommand::FrameRange range = DumpCommand::parseRange(options.frames);
-        report.frames.first = range.first;
-        report.frames.last = range.last;
+    if (options.frames) {
+        report.frames.first = options.frames->first;
+        report.frames.last = options.frames->last;
     }
     // The recording is read as it plays, so that its length does not matter.
     // A bad output path fails before the replay; a recording that turns out
@@ -30,7 +29,9 @@ void ReportCommand::run(const Options& options, std::ostream& err)
     OutputFile out(options.output, {options.file});
     report.source = std::filesystem::path(options.file).filename().string();
     report.title = options.title.empty() ? report.source : options.title;
-    report.settings = options.settings;
+    for (const StateArguments::Setting& setting : options.settings) {
+        report.settings.emplace_back(setting.key, setting.text);
+    }
 
     auto pipeline = std::make_shared<VeltoTouch::Pipeline>();
     StateArguments::apply(*pipeline, options.settings, err);
@@ -40,6 +41,23 @@ void ReportCommand::run(const Options& options, std::ostream& err)
         },
         pipeline, report);
     out.commit();
+}
+
+void ReportCommand::addTo(CLI::App& app, int&, std::ostream&, std::ostream& err)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command = app.add_subcommand("report", "Replay a recording into a self-contained HTML page");
+    command->add_option("FILE", options->file, "Recording (container, or hid-recorder text)")->required();
+    command->add_option("-o,--output", options->output, "HTML page to write")->required();
+    CommandLine::addSettings(*command, options->settings,
+                             "KEY=VALUE: pipeline state before the first frame (VALUE is JSON)");
+    CommandLine::addParsed(
+        *command, "--frames", "TEXT:A:B",
+        [&frames = options->frames](const std::string& text) { frames = DumpCommand::parseRange(text); },
+        "A:B, inclusive range of frame numbers to show");
+    command->add_option("--title", options->title, "Title of the page (default: the recording's file name)");
+    CommandLine::addHidDevice(*command, options->hidDevice);
+    command->callback([options, &err] { run(*options, err); });
 }
 
 }  // namespace VeltoTool

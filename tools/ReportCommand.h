@@ -1,11 +1,17 @@
 #pragma once
 
+#include "DumpCommand.h"
+#include "StateArguments.h"
+
 #include <cstdint>
 #include <optional>
 #include <ostream>
 #include <string>
-#include <utility>
 #include <vector>
+
+namespace CLI {
+class App;
+}
 
 namespace VeltoTool {
 
@@ -18,9 +24,9 @@ public:
         std::string file;
         std::string output;
         // Pipeline state applied before the first frame, as for replay.
-        std::vector<std::pair<std::string, std::string>> settings;
-        // "A:B", inclusive frame numbers to show (either side may be left out).
-        std::string frames;
+        std::vector<StateArguments::Setting> settings;
+        // Frame numbers to show; empty: all.
+        std::optional<DumpCommand::FrameRange> frames;
         // Default: the recording's file name.
         std::string title;
         // Of a hid-recorder file holding several devices, the one to read;
@@ -30,6 +36,9 @@ public:
 
     // Warnings go to `err`. Throws ToolError or the recording's own errors.
     static void run(const Options& options, std::ostream& err);
+
+    // `report` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

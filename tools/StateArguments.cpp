@@ -71,6 +71,13 @@ VeltoHost::PropertyValue StateArguments::parseValue(const std::string& key, cons
     return VeltoHost::PropertyValue::string(text);
 }
 
+StateArguments::Setting StateArguments::parseSetting(const std::string& argument)
+{
+    auto [key, text] = split(argument);
+    VeltoHost::PropertyValue value = parseValue(key, text);
+    return {std::move(key), std::move(text), std::move(value)};
+}
+
 std::optional<std::string> StateArguments::readBackWarning(const std::string& key, const PropertyValue& written,
                                                            const PropertyValue& readBack)
 {
@@ -87,11 +94,9 @@ std::optional<std::string> StateArguments::readBackWarning(const std::string& ke
     return key + " was set to " + written.description() + " but reads back " + readBack.description();
 }
 
-void StateArguments::apply(VeltoTouch::Pipeline& pipeline,
-                           const std::vector<std::pair<std::string, std::string>>& settings, std::ostream& err)
+void StateArguments::apply(VeltoTouch::Pipeline& pipeline, const std::vector<Setting>& settings, std::ostream& err)
 {
-    for (const auto& [key, valueText] : settings) {
-        const VeltoHost::PropertyValue value = parseValue(key, valueText);
+    for (const auto& [key, text, value] : settings) {
         pipeline.setState(key, value);
         if (auto warning = readBackWarning(key, value, pipeline.getState(key))) {
             err << "veltotouch: warning: " << *warning << '\n';

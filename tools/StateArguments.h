@@ -1,7 +1,7 @@
 #pragma once
 
 #include "pipeline/Pipeline.h"
-#include "platform/PropertyValue.h"
+#include "platform/values/PropertyValue.h"
 
 #include <optional>
 #include <ostream>
@@ -23,6 +23,15 @@ public:
     // that --set Key=text works without shell-quoted quotes.
     static VeltoHost::PropertyValue parseValue(const std::string& key, const std::string& text);
 
+    // One KEY=VALUE argument, its value parsed once.
+    struct Setting {
+        std::string key;
+        std::string text;  // VALUE as written
+        VeltoHost::PropertyValue value;
+    };
+    // split, then parseValue; throws their ToolError.
+    static Setting parseSetting(const std::string& argument);
+
     // The pipeline converts a setting instead of refusing it: a string
     // written as the threshold is stored as 0, 1e40 as infinity, 2^32 + 500
     // as a timeout of 500. Given what was written and what the key reads
@@ -37,8 +46,7 @@ public:
     // Writes each KEY=JSON setting into the pipeline and reads it back at
     // once, so that one the pipeline converted (a string stored as 0) is
     // reported on `err` before it skews a whole replay.
-    static void apply(VeltoTouch::Pipeline& pipeline, const std::vector<std::pair<std::string, std::string>>& settings,
-                      std::ostream& err);
+    static void apply(VeltoTouch::Pipeline& pipeline, const std::vector<Setting>& settings, std::ostream& err);
 };
 
 }  // namespace VeltoTool

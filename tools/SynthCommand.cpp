@@ -1,5 +1,7 @@
 #include "SynthCommand.h"
 
+#include "CommandLine.h"
+#include "FiniteNumberCheck.h"
 #include "GestureScript.h"
 #include "OutputFile.h"
 #include "RandomScript.h"
@@ -9,6 +11,7 @@
 #include "recording/ContainerWriter.h"
 
 #include <functional>
+#include <memory>
 #include <optional>
 #include <sstream>
 
@@ -100,6 +103,29 @@ void SynthCommand::run(const Options& options)
                    truth ? &*truth : nullptr);
     out.commit();
     if (truth) truth->commit();
+}
+
+void SynthCommand::addTo(CLI::App& app, int&, std::ostream&, std::ostream&)
+{
+    auto options = std::make_shared<Options>();
+    CLI::App* command = app.add_subcommand("synth", "Write a recording made from a gesture script");
+    CLI::Option* script =
+        command->add_option("SCRIPT", options->script, "Gesture script, or @FILE to read it from a file");
+    command->add_option("-o,--output", options->output, "Recording to write")->required();
+    command->add_option("--frame-period", options->framePeriodMs, "Milliseconds between frames, at least 1")
+        ->check(FiniteNumberCheck(1))
+        ->capture_default_str();
+    command->add_option("--seed", options->seed, "Seed of the sensor noise (and of --random)")->capture_default_str();
+    command
+        ->add_option("--random", options->randomTouches,
+                     "N: instead of a SCRIPT, N touches drawn at random (kinds, durations, positions, sizes, noise, "
+                     "gaps)")
+        ->check(CLI::Range(1u, 1'000'000u))
+        ->excludes(script);
+    command->add_option("--truth", options->truth,
+                        "TRUTH.jsonl: also write one JSON line per touch, noise and reset (\"auto\": FILE with its "
+                        "extension replaced by .truth.jsonl, where eval looks for it)");
+    command->callback([options] { run(*options); });
 }
 
 }  // namespace VeltoTool

@@ -1,7 +1,12 @@
 #pragma once
 
 #include <cstdint>
+#include <ostream>
 #include <string>
+
+namespace CLI {
+class App;
+}
 
 namespace VeltoTool {
 
@@ -25,6 +30,9 @@ public:
     static void run(const Options& options);
     // The container text, without touching the file system.
     static std::string containerFor(const std::string& script, std::uint32_t framePeriodMs, std::uint32_t seed);
+
+    // `synth` on the command line (see CommandLine): its options, and its run.
+    static void addTo(CLI::App& app, int& status, std::ostream& out, std::ostream& err);
 };
 
 }  // namespace VeltoTool

@@ -1,8 +1,8 @@
 #include "algs/Algs.h"
 
 #include "algs/DecisionDump.h"
+#include "platform/values/PropertyDictionary.h"
 #include "records/DomainKey.h"
-#include "platform/PropertyDictionary.h"
 
 #include <sstream>
 #include <tuple>

@@ -9,10 +9,10 @@
 #include "algs/TouchPhase.h"
 #include "algs/VirtualImage.h"
 #include "algs/VirtualPixel.h"
+#include "platform/log/Log.h"
+#include "platform/plugin/HidEvent.h"
+#include "platform/values/PropertyValue.h"
 #include "records/InputReport.h"
-#include "platform/HidEvent.h"
-#include "platform/Log.h"
-#include "platform/PropertyValue.h"
 
 #include <array>
 #include <cstdint>

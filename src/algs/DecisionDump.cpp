@@ -1,6 +1,6 @@
 #include "algs/DecisionDump.h"
 
-#include "platform/LogFormat.h"
+#include "platform/log/LogFormat.h"
 
 #include <cstdarg>
 #include <cstdio>

@@ -4,8 +4,8 @@
 #include "algs/PixelRegion.h"
 #include "algs/TouchPhase.h"
 #include "algs/VirtualImage.h"
+#include "platform/plugin/HidEvent.h"
 #include "records/InputReport.h"
-#include "platform/HidEvent.h"
 
 #include <array>
 #include <cstdint>

@@ -1,6 +1,6 @@
 #include "algs/EventStats.h"
 
-#include "platform/PropertyDictionary.h"
+#include "platform/values/PropertyDictionary.h"
 
 #include <string_view>
 

@@ -1,7 +1,7 @@
 #pragma once
 
 #include "algs/HandStats.h"
-#include "platform/PropertyValue.h"
+#include "platform/values/PropertyValue.h"
 
 #include <array>
 #include <cstddef>

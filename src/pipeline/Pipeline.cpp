@@ -1,7 +1,7 @@
 #include "pipeline/Pipeline.h"
 
+#include "platform/values/PropertyDictionary.h"
 #include "records/DomainKey.h"
-#include "platform/PropertyDictionary.h"
 
 namespace VeltoTouch {
 

@@ -1,10 +1,10 @@
 #pragma once
 
 #include "algs/Algs.h"
-#include "records/InputReport.h"
 #include "pipeline/PipelineInput.h"
 #include "pipeline/PipelineOutput.h"
-#include "platform/HidEvent.h"
+#include "platform/plugin/HidEvent.h"
+#include "records/InputReport.h"
 
 #include <functional>
 #include <optional>

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/PropertyValue.h"
+#include "platform/values/PropertyValue.h"
 
 #include <string>
 

@@ -1,7 +1,7 @@
 #include "recording/ContainerFrames.h"
 
+#include "platform/values/PropertyDictionary.h"
 #include "records/HexText.h"
-#include "platform/PropertyDictionary.h"
 
 #include <array>
 #include <cstdint>

@@ -1,6 +1,6 @@
 #include "recording/ContainerReadAhead.h"
 
-#include "platform/BoundedQueue.h"
+#include "platform/runtime/BoundedQueue.h"
 
 #include <exception>
 #include <thread>

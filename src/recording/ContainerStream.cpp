@@ -1,9 +1,9 @@
 #include "recording/ContainerStream.h"
 
+#include "platform/values/PropertyDictionary.h"
 #include "recording/ContainerFrames.h"
 #include "recording/ContainerWriter.h"
 #include "recording/HidRecorderReader.h"
-#include "platform/PropertyDictionary.h"
 #include "recording/JsonValue.h"
 #include "recording/PropertyValueBuilder.h"
 

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/HidrawDescription.h"
+#include "platform/devices/HidrawDescription.h"
 #include "recording/PipelineRecording.h"
 
 #include <cstddef>

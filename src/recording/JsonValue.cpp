@@ -2,8 +2,8 @@
 
 #include "recording/PropertyValueBuilder.h"
 
+#include "platform/values/PropertyDictionary.h"
 #include "records/HexText.h"
-#include "platform/PropertyDictionary.h"
 
 #include <nlohmann/json.hpp>
 

@@ -1,12 +1,12 @@
 #include "recording/PipelineRecording.h"
 
-#include "records/TickConversion.h"
-#include "platform/MonotonicClock.h"
-#include "platform/PropertyDictionary.h"
+#include "platform/runtime/MonotonicClock.h"
+#include "platform/values/PropertyDictionary.h"
 #include "recording/ContainerFrames.h"
 #include "recording/ContainerWriter.h"
 #include "recording/HidRecorderReader.h"
 #include "recording/JsonValue.h"
+#include "records/TickConversion.h"
 
 #include <algorithm>
 #include <limits>

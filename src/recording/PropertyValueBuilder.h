@@ -1,7 +1,7 @@
 #pragma once
 
-#include "platform/PropertyDictionary.h"
-#include "platform/PropertyValue.h"
+#include "platform/values/PropertyDictionary.h"
+#include "platform/values/PropertyValue.h"
 
 #include <cstddef>
 #include <cstdint>

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/HidEvent.h"
+#include "platform/plugin/HidEvent.h"
 
 #include <cstdint>
 #include <optional>

@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/MonotonicClock.h"
+#include "platform/runtime/MonotonicClock.h"
 
 #include <functional>
 #include <mutex>

@@ -2,15 +2,15 @@
 
 #include "service/ServicePropertyKey.h"
 
-#include "records/FeatureReport.h"
-#include "records/InputReport.h"
+#include "platform/log/LogFormat.h"
+#include "platform/log/Trace.h"
+#include "platform/plugin/HidEvent.h"
+#include "platform/runtime/Thread.h"
+#include "platform/values/PropertyDictionary.h"
 #include "records/DomainKey.h"
+#include "records/FeatureReport.h"
 #include "records/HexText.h"
-#include "platform/HidEvent.h"
-#include "platform/LogFormat.h"
-#include "platform/PropertyDictionary.h"
-#include "platform/Thread.h"
-#include "platform/Trace.h"
+#include "records/InputReport.h"
 
 #include <algorithm>
 #include <memory>

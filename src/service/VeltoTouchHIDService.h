@@ -1,13 +1,13 @@
 #pragma once
 
 #include "pipeline/Pipeline.h"
-#include "platform/HostDevice.h"
-#include "platform/Log.h"
-#include "platform/RunLoop.h"
-#include "platform/InputReportThread.h"
-#include "platform/SerialQueue.h"
+#include "platform/devices/HostDevice.h"
+#include "platform/log/Log.h"
+#include "platform/plugin/InputReportThread.h"
+#include "platform/plugin/VeltoHIDService.h"
+#include "platform/runtime/RunLoop.h"
+#include "platform/runtime/SerialQueue.h"
 #include "recording/PipelineRecording.h"
-#include "platform/VeltoHIDService.h"
 
 #include <array>
 #include <cstdint>

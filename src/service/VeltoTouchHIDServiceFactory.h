@@ -1,6 +1,6 @@
 #pragma once
 
-#include "platform/PluginInterface.h"
+#include "platform/plugin/PluginInterface.h"
 
 // The module's one exported entry point, found by name by the host's loader.
 // Returns the plug-in interface of a new service holding one reference for

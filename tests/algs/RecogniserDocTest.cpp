@@ -1,7 +1,7 @@
 // docs/recogniser.md shows the event decision as a table; it must be the
 // code's table, row for row.
 #include "algs/Algs.h"
-#include "platform/HidEvent.h"
+#include "platform/plugin/HidEvent.h"
 #include "records/Gesture.h"
 
 #include <gtest/gtest.h>

@@ -1,9 +1,9 @@
 #include "RecordingTestSupport.h"
 
-#include "records/HexText.h"
-#include "platform/PropertyDictionary.h"
+#include "platform/values/PropertyDictionary.h"
 #include "recording/ContainerWriter.h"
 #include "recording/JsonValue.h"
+#include "records/HexText.h"
 
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>

@@ -1,4 +1,4 @@
-#include "platform/PropertyDictionary.h"
+#include "platform/values/PropertyDictionary.h"
 #include "recording/JsonValue.h"
 
 #include <gtest/gtest.h>

@@ -1,7 +1,7 @@
 #include "RecordingTestSupport.h"
 
+#include "platform/runtime/MonotonicClock.h"
 #include "records/TickConversion.h"
-#include "platform/MonotonicClock.h"
 
 #include <gtest/gtest.h>
 

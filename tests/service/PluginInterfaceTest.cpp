@@ -1,8 +1,8 @@
 // The factory, driven the way the host drives it: through interface pointers only.
 
-#include "platform/HidEvent.h"
-#include "platform/PluginInterface.h"
-#include "platform/PropertyDictionary.h"
+#include "platform/plugin/HidEvent.h"
+#include "platform/plugin/PluginInterface.h"
+#include "platform/values/PropertyDictionary.h"
 #include "service/VeltoTouchHIDServiceFactory.h"
 
 #include <gtest/gtest.h>

@@ -2,10 +2,10 @@
 // queue: reports in, events out at the host's callback, one delivery job per
 // report.
 
-#include "records/TickConversion.h"
-#include "platform/PropertyDictionary.h"
-#include "platform/Trace.h"
+#include "platform/log/Trace.h"
+#include "platform/values/PropertyDictionary.h"
 #include "recording/PipelineRecording.h"
+#include "records/TickConversion.h"
 #include "service/ServiceHarness.h"
 
 #include <gtest/gtest.h>

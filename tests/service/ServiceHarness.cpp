@@ -1,10 +1,10 @@
 #include "service/ServiceHarness.h"
 
+#include "platform/devices/HostDeviceRegistry.h"
+#include "platform/devices/SimulatedHostDevice.h"
+#include "platform/runtime/MonotonicClock.h"
+#include "platform/values/PropertyDictionary.h"
 #include "records/InputReport.h"
-#include "platform/HostDeviceRegistry.h"
-#include "platform/MonotonicClock.h"
-#include "platform/PropertyDictionary.h"
-#include "platform/SimulatedHostDevice.h"
 #include "service/VeltoTouchHIDServiceFactory.h"
 
 #include <gtest/gtest.h>

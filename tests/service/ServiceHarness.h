@@ -2,10 +2,10 @@
 
 #include "records/ReportBytes.h"
 
-#include "platform/HidEvent.h"
-#include "platform/PluginInterface.h"
-#include "platform/PropertyValue.h"
-#include "platform/SerialQueue.h"
+#include "platform/plugin/HidEvent.h"
+#include "platform/plugin/PluginInterface.h"
+#include "platform/runtime/SerialQueue.h"
+#include "platform/values/PropertyValue.h"
 
 #include <condition_variable>
 #include <initializer_list>

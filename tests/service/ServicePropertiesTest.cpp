@@ -2,8 +2,8 @@
 // device's own keys, read and written while reports flow; and the device
 // failures that properties and start must survive.
 
-#include "platform/PropertyDictionary.h"
-#include "platform/SimulatedHostDevice.h"
+#include "platform/devices/SimulatedHostDevice.h"
+#include "platform/values/PropertyDictionary.h"
 #include "recording/PipelineRecording.h"
 #include "service/ServiceHarness.h"
 #include "service/ServicePropertyKey.h"

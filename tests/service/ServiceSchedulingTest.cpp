@@ -2,9 +2,9 @@
 // times over, the callback taken at scheduling, and deliveries that are still
 // queued when the thread goes.
 
-#include "platform/PropertyDictionary.h"
-#include "platform/Semaphore.h"
-#include "platform/SimulatedHostDevice.h"
+#include "platform/devices/SimulatedHostDevice.h"
+#include "platform/runtime/Semaphore.h"
+#include "platform/values/PropertyDictionary.h"
 #include "service/ServiceHarness.h"
 
 #include <gtest/gtest.h>

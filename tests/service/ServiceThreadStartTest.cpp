@@ -4,12 +4,12 @@
 // for a service that was never scheduled. That stop and the last release do
 // not wait either is the thread's own guarantee (InputReportThreadTest).
 
-#include "platform/CaptureLogSink.h"
-#include "platform/Log.h"
-#include "platform/PropertyDictionary.h"
-#include "platform/Semaphore.h"
-#include "platform/SimulatedHostDevice.h"
-#include "platform/Thread.h"
+#include "platform/devices/SimulatedHostDevice.h"
+#include "platform/log/CaptureLogSink.h"
+#include "platform/log/Log.h"
+#include "platform/runtime/Semaphore.h"
+#include "platform/runtime/Thread.h"
+#include "platform/values/PropertyDictionary.h"
 #include "service/ServiceHarness.h"
 
 #include <gtest/gtest.h>

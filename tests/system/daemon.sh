@@ -724,6 +724,21 @@ same_reports() {
     return 1
 }
 
+# A process has ended (it may be a zombie not yet waited for).
+exited() {
+    local stat
+    read -r stat <"/proc/$1/stat" 2>/dev/null || return 0
+    [[ $stat == *") Z "* ]]
+}
+# Where a process is: its state, what it waits in, its system call.
+state_of() {
+    local stat wchan syscall
+    read -r stat <"/proc/$1/stat" 2>/dev/null
+    read -r wchan <"/proc/$1/wchan" 2>/dev/null
+    read -r syscall <"/proc/$1/syscall" 2>/dev/null
+    echo "${stat#*) } | wchan ${wchan:-?} | syscall ${syscall:-?}"
+}
+
 case_record() {
     local ok=0 source=examples/taps.json format status pid log delay
     reports_of "$source" >"$work/record.source" || { note "case 9: convert failed"; return 1; }
@@ -782,8 +797,13 @@ case_record() {
     start_emulate "$source" --product 0x9999 --speed 10 --loop
     wait_until 60 "the surface's hidraw node" find_hidraw 9999 || return 1
     wait_until 60 "udev to take in $node" udev_has "$node" || return 1
+    local round=0
     for format in json hid json hid duration; do
-        log=$results/record-cut-$format.log
+        # A log of its own each round: the wait for its first line must not
+        # see an earlier round's, or the SIGINT could come before record
+        # takes it (a background command starts with SIGINT ignored).
+        round=$((round + 1))
+        log=$results/record-cut-$round-$format.log
         if [ $format = duration ]; then
             "${on_cpu0[@]}" "$tool" record "$node" -o "$work/cut.$format.json" --duration 1.5 >"$log" 2>&1 &
         else
@@ -795,6 +815,12 @@ case_record() {
         if [ $format != duration ]; then
             pause "$((delay / 1000)).$(printf %03d $((delay % 1000)))"
             kill -INT "$pid"
+        fi
+        if ! wait_until 60 "record ($format) to end" exited "$pid"; then
+            note "case 9: record ($format) did not end after $delay ms and a SIGINT: state $(state_of "$pid")"
+            kill -KILL "$pid"
+            wait "$pid"
+            return 1
         fi
         wait "$pid"
         status=$?

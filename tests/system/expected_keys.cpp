@@ -12,8 +12,8 @@
 // kernel's keys with the product's rules, not with a copy of them. Every
 // surface in the system test ends unplugged, which releases a key still held
 // (KeyMap::releaseAll()); --no-unplug leaves that out.
-#include "host/Gesture.h"
-#include "host/KeyMap.h"
+#include "daemon/KeyMap.h"
+#include "records/Gesture.h"
 
 #include <nlohmann/json.hpp>
 
@@ -24,7 +24,7 @@
 
 namespace {
 
-using VeltoHost::Gesture;
+using VeltoTouch::Gesture;
 using VeltoHost::KeyMap;
 
 void print(const KeyMap::Actions& actions)

@@ -2,7 +2,7 @@
 #include "ToolError.h"
 #include "ToolFiles.h"
 #include "ToolTestSupport.h"
-#include "platform/FakeUhidKernel.h"
+#include "platform/devices/FakeUhidKernel.h"
 #include "recording/HidRecorderReader.h"
 
 #include <gtest/gtest.h>

@@ -1,9 +1,9 @@
 #include "EmulateCommand.h"
 #include "ToolError.h"
 #include "ToolTestSupport.h"
-#include "platform/FakeUhidKernel.h"
-#include "records/FeatureReport.h"
+#include "platform/devices/FakeUhidKernel.h"
 #include "recording/PipelineRecording.h"
+#include "records/FeatureReport.h"
 
 #include <gtest/gtest.h>
 #include <linux/input.h>

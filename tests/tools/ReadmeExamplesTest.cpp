@@ -5,8 +5,8 @@
 #include "ToolProcessSupport.h"
 #include "ToolTestSupport.h"
 
-#include "host/BusService.h"
-#include "host/ControlClient.h"
+#include "bus/BusService.h"
+#include "bus/ControlClient.h"
 
 #include <gtest/gtest.h>
 

@@ -1,5 +1,5 @@
+#include "platform/runtime/MonotonicClock.h"
 #include "records/TickConversion.h"
-#include "platform/MonotonicClock.h"
 
 #include <gtest/gtest.h>
 

@@ -2,7 +2,7 @@
 // 125/3 ns instead of the nanosecond: a tick count used as nanoseconds (or
 // the other way round) anywhere in recording or playback then shows.
 
-#include "platform/MonotonicClock.h"
+#include "platform/runtime/MonotonicClock.h"
 
 #include <gtest/gtest.h>
 

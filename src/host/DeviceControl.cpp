@@ -1,8 +1,0 @@
-#include "host/DeviceControl.h"
-
-namespace VeltoHost {
-
-// Defined out of line so that the class's virtual table has one home.
-DeviceControl::~DeviceControl() = default;
-
-}  // namespace VeltoHost

@@ -1,0 +1,174 @@
+#include "recording/SimulatedDevicePlayer.h"
+
+#include "platform/plugin/HostEventSystem.h"
+#include "platform/runtime/MonotonicClock.h"
+#include "recording/RecordingTestSupport.h"
+#include "records/TickConversion.h"
+
+#include <gtest/gtest.h>
+
+#include <unistd.h>
+
+#include <atomic>
+#include <cstdio>
+#include <memory>
+#include <stdexcept>
+#include <string>
+#include <thread>
+#include <vector>
+
+using namespace VeltoHost;
+using VeltoTouch::PipelineRecording;
+
+namespace {
+
+PipelineRecording::Frame report(std::uint8_t id, std::uint64_t timestampNs)
+{
+    PipelineRecording::Frame frame;
+    frame.type = PipelineRecording::Frame::Type::InputReport;
+    frame.timestampNs = timestampNs;
+    frame.report = {id};
+    return frame;
+}
+
+// Hands over the frames, then raises `fault` unless it is empty.
+SimulatedDevicePlayer::FrameSource frames(std::vector<PipelineRecording::Frame> list, std::string fault = "")
+{
+    return [list = std::move(list), fault](const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+                                           const SimulatedDevicePlayer::StopCheck&) {
+        for (PipelineRecording::Frame frame : list) onFrame(std::move(frame));
+        if (!fault.empty()) throw std::invalid_argument(fault);
+    };
+}
+
+using RecordingTestSupport::TempFile;
+
+SimulatedDevicePlayer atSpeedZero(const SimulatedHostDevice::Ref& device,
+                                  std::function<bool()> stop = [] { return false; })
+{
+    return SimulatedDevicePlayer(
+        device, [](const std::string&, const PropertyValue&) {}, std::move(stop), {.speed = 0});
+}
+
+}  // namespace
+
+TEST(SimulatedDevicePlayerTest, AStopRequestEndsEveryWait)
+{
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();  // never scheduled: nothing is taken
+    std::atomic<bool> stop{false};
+    std::vector<std::string> notices;
+    SimulatedDevicePlayer player(
+        device, [](const std::string&, const PropertyValue&) { ADD_FAILURE() << "state written"; },
+        [&] { return stop.load(); }, {1.0, 512},
+        GapCap(3600.0, [&](const std::string& text) { notices.push_back(text); }));
+
+    ASSERT_TRUE(player.play(report(1, 0)));
+    std::thread stopper([&] {
+        MonotonicClock::sleepMicroseconds(50'000);
+        stop = true;
+    });
+    // A gap of a year, and a state write that waits for a report nobody takes:
+    // both return once the stop is requested.
+    EXPECT_FALSE(player.play(report(2, 365ull * 24 * 3600 * 1'000'000'000ull)));
+    PipelineRecording::Frame state;
+    state.type = PipelineRecording::Frame::Type::State;
+    state.key = "K";
+    state.value = PropertyValue::uint32(1);
+    EXPECT_FALSE(player.play(state));
+    EXPECT_FALSE(player.waitUntilTaken());
+    stopper.join();
+    EXPECT_EQ(player.reportsPushed(), 1u);
+    ASSERT_EQ(notices.size(), 1u);
+    EXPECT_NE(notices[0].find("--max-gap"), std::string::npos);
+}
+
+TEST(SimulatedDevicePlayerTest, ASimulatedDeviceNameIsItsRecordingAfterThePrefix)
+{
+    EXPECT_EQ(SimulatedDevicePlayer::recordingPath("sim:a/b.json"), "a/b.json");
+    EXPECT_EQ(SimulatedDevicePlayer::recordingPath("sim:"), "");
+    EXPECT_EQ(SimulatedDevicePlayer::recordingPath("/dev/hidraw0"), std::nullopt);
+    EXPECT_EQ(SimulatedDevicePlayer::recordingPath("x:sim:a"), std::nullopt);
+}
+
+TEST(SimulatedDevicePlayerTest, AStreamIsPlayedAsItArrivesAndItsFaultComesAfterTheFramesBeforeIt)
+{
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();  // never scheduled: reports stay pending
+    SimulatedDevicePlayer player = atSpeedZero(device);
+    EXPECT_EQ(player.playStream(frames({report(1, 10), report(2, 20)})), SimulatedDevicePlayer::Ending::Finished);
+    EXPECT_EQ(device->pendingReportCount(), 2u);
+    try {
+        player.playStream(frames({report(3, 30)}, "invalid report"));
+        ADD_FAILURE() << "the fault was not raised";
+    } catch (const std::invalid_argument& error) {
+        EXPECT_STREQ(error.what(), "invalid report");
+    }
+    EXPECT_EQ(device->pendingReportCount(), 3u);
+    EXPECT_EQ(player.reportsPushed(), 3u);
+}
+
+TEST(SimulatedDevicePlayerTest, AStopEndsAStreamAndIsToldFromAFault)
+{
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+    bool stop = false;
+    SimulatedDevicePlayer player = atSpeedZero(device, [&] { return stop; });
+    // Stopped between two frames: the rest is not played.
+    const SimulatedDevicePlayer::FrameSource stopping = [&](const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+                                                            const SimulatedDevicePlayer::StopCheck&) {
+        onFrame(report(1, 10));
+        stop = true;
+        onFrame(report(2, 20));
+        ADD_FAILURE() << "played on after the stop";
+    };
+    EXPECT_EQ(player.playStream(stopping), SimulatedDevicePlayer::Ending::Stopped);
+    EXPECT_EQ(player.reportsPushed(), 1u);
+    // A reader cut short by the stop may take it for a fault: it is a stop.
+    EXPECT_EQ(player.playStream(frames({}, "the read was stopped")), SimulatedDevicePlayer::Ending::Stopped);
+}
+
+TEST(SimulatedDevicePlayerTest, ReadAheadPlaysAContainerFileAndTheNamedDeviceOfAHidRecorderFile)
+{
+    const TempFile container(R"({"Version": 1, "Frames": [)"
+                             R"({"Type": "InputReport", "Timestamp": 5, "Report": "02 01"},)"
+                             R"({"Type": "InputReport", "Timestamp": 7, "Report": "02 02"}]})");
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+    SimulatedDevicePlayer player = atSpeedZero(device);
+    EXPECT_EQ(player.playStream(SimulatedDevicePlayer::readAhead(container.fd())),
+              SimulatedDevicePlayer::Ending::Finished);
+    EXPECT_EQ(device->pendingReportCount(), 2u);
+
+    // Device 0 of the example is a keyboard with 5 events, device 1 the
+    // surface with 133, the one read when none is named.
+    const std::string example = std::string(VELTO_EXAMPLES_DIR) + "/hid-recorder-two-devices.hid";
+    for (const auto& [hidDevice, reports] :
+         {std::pair{std::optional<std::uint32_t>(0), 5u}, std::pair{std::optional<std::uint32_t>(), 133u}}) {
+        std::unique_ptr<std::FILE, int (*)(std::FILE*)> file(std::fopen(example.c_str(), "rbe"), &std::fclose);
+        ASSERT_TRUE(file) << example;
+        SimulatedHostDevice::Ref hidRecorded = SimulatedHostDevice::create();
+        SimulatedDevicePlayer hidPlayer = atSpeedZero(hidRecorded);
+        hidPlayer.playStream(SimulatedDevicePlayer::readAhead(::fileno(file.get()), hidDevice));
+        EXPECT_EQ(hidRecorded->pendingReportCount(), reports);
+    }
+}
+
+// The plug-in records a report at the time the device stamped it (here,
+// when it was pushed), not when its turn came on the plug-in's thread.
+TEST(SimulatedDevicePlayerTest, ThePlugInRecordsEachReportAtItsDeviceTimeStamp)
+{
+    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
+    SimulatedDevicePlayer player = atSpeedZero(device);
+    const std::uint64_t beforePush = VeltoTouch::Util::nanosecondsFromMachTime(MonotonicClock::now());
+    for (std::uint8_t i = 0; i < 3; ++i) ASSERT_TRUE(player.play(report(2, i)));
+    const std::uint64_t afterPush = VeltoTouch::Util::nanosecondsFromMachTime(MonotonicClock::now());
+    // Only now does a plug-in take the device: the reports waited for it.
+    HostEventSystem host;
+    host.start(VELTO_SERVICE_MODULE_PATH, "VeltoTouchHIDServiceFactory", device);
+    ASSERT_TRUE(player.waitUntilTaken());
+    host.unschedule();
+    const PipelineRecording recording(std::string_view(host.copyProperty("Recording").asString()));
+    host.stop();
+    ASSERT_EQ(recording.frames().size(), 3u);
+    for (const PipelineRecording::Frame& frame : recording.frames()) {
+        EXPECT_GE(frame.timestampNs, beforePush);
+        EXPECT_LE(frame.timestampNs, afterPush);
+    }
+}
