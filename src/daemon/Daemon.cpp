@@ -252,13 +252,8 @@ void Daemon::attachSimulated(const std::string& file)
     _sessions.back().player = std::jthread([log = _log, name, session, device = std::move(device),
                                             recording = std::move(recording), speed = _options.speed,
                                             hidDevice = _options.hidDevice](std::stop_token stop) {
-        SimulatedDevicePlayer player(
-            device,
-            [session](const std::string& key, const PropertyValue& value) {
-                session->control().setPropertyUnchecked(std::string(SimulatedDevicePlayer::kStateDomain) + key,
-                                                        value);
-            },
-            [&stop] { return stop.stop_requested(); }, {.speed = speed});
+        SimulatedDevicePlayer player(device, session->stateWriter(), [&stop] { return stop.stop_requested(); },
+                                     {.speed = speed});
         try {
             player.playStream(SimulatedDevicePlayer::readAhead(::fileno(recording.get()), hidDevice));
         } catch (const std::exception& error) {

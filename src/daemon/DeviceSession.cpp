@@ -1,7 +1,5 @@
 #include "daemon/DeviceSession.h"
 
-#include "recording/SimulatedDevicePlayer.h"
-
 #include <stdexcept>
 #include <utility>
 
@@ -45,8 +43,6 @@ DeviceSession::~DeviceSession() { takeApart(); }
 
 void DeviceSession::takeApart() noexcept
 {
-    _stopPlaying = true;
-    if (_player.joinable()) _player.join();
     // Every event the plug-in sent has been published and keyed when this returns.
     _host.unschedule();
     _host.unsubscribe(_subscription);
@@ -68,39 +64,11 @@ void DeviceSession::changeKeys(const KeyMap::Bindings& keys, KeyboardSink* keybo
     queue->drain();
 }
 
-void DeviceSession::playInBackground(VeltoTouch::PipelineRecording recording, SimulatedHostDevice::Ref device,
-                                     double speed)
+SimulatedDevicePlayer::StateWriter DeviceSession::stateWriter()
 {
-    if (_player.joinable()) throw std::logic_error("a device session plays one recording");
-    _player = std::thread([this, recording = std::move(recording), device = std::move(device), speed] {
-        play(recording, device, speed);
-        if (_stopPlaying) return;
-        std::lock_guard guard(_playedLock);
-        _played = true;
-        _playedChanged.notify_all();
-    });
-}
-
-bool DeviceSession::waitUntilPlayed(std::chrono::nanoseconds timeout)
-{
-    std::unique_lock guard(_playedLock);
-    return _playedChanged.wait_for(guard, timeout, [this] { return _played; });
-}
-
-std::uint64_t DeviceSession::play(const VeltoTouch::PipelineRecording& recording,
-                                  const SimulatedHostDevice::Ref& device, double speed)
-{
-    SimulatedDevicePlayer player(
-        device,
-        [this](const std::string& key, const PropertyValue& value) {
-            _control->setPropertyUnchecked(std::string(SimulatedDevicePlayer::kStateDomain) + key, value);
-        },
-        [this] { return _stopPlaying.load(); }, {.speed = speed});
-    for (const VeltoTouch::PipelineRecording::Frame& frame : recording.frames()) {
-        if (!player.play(frame)) break;
-    }
-    player.waitUntilTaken();
-    return player.reportsPushed();
+    return [this](const std::string& key, const PropertyValue& value) {
+        _control->setPropertyUnchecked(std::string(SimulatedDevicePlayer::kStateDomain) + key, value);
+    };
 }
 
 // Each event is decoded once, here: its gesture presses the keys and, with

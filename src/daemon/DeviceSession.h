@@ -4,18 +4,14 @@
 #include "daemon/HostDeviceControl.h"
 #include "daemon/KeyMap.h"
 #include "daemon/KeyboardSink.h"
-#include "platform/devices/SimulatedHostDevice.h"
 #include "platform/plugin/HostEventSystem.h"
-#include "recording/PipelineRecording.h"
+#include "recording/SimulatedDevicePlayer.h"
 
 #include <atomic>
-#include <chrono>
-#include <condition_variable>
 #include <memory>
 #include <mutex>
 #include <optional>
 #include <string>
-#include <thread>
 #include <vector>
 
 namespace VeltoHost {
@@ -31,8 +27,8 @@ namespace VeltoHost {
 // actions at a time, so that two devices never interleave a press and its
 // release.
 //
-// Taken apart in the order that leaves nothing behind: the simulated
-// device's playback stops; the plug-in is unscheduled (its last events are
+// Taken apart in the order that leaves nothing behind (a simulated device's
+// player has stopped before): the plug-in is unscheduled (its last events are
 // delivered); a key still held is released; the bus object is withdrawn; the
 // plug-in is stopped.
 class DeviceSession {
@@ -51,18 +47,10 @@ public:
     DeviceSession(const DeviceSession&) = delete;
     DeviceSession& operator=(const DeviceSession&) = delete;
 
-    // Plays `recording` into the simulated device on a thread of its own, paced
-    // at `speed` (0: as fast as the plug-in takes reports), its state frames
-    // written as "Pipeline" properties. The device stays attached afterwards,
-    // idle, so that its properties can still be read.
-    void playInBackground(VeltoTouch::PipelineRecording recording, SimulatedHostDevice::Ref device, double speed);
-    // True once the playback has handed every report to the plug-in.
-    bool waitUntilPlayed(std::chrono::nanoseconds timeout);
-    // The same playback on the calling thread, returning once the plug-in has
-    // taken every report (or the session is being taken apart); the number
-    // of reports pushed.
-    std::uint64_t play(const VeltoTouch::PipelineRecording& recording, const SimulatedHostDevice::Ref& device,
-                       double speed);
+    // Writes a recording's state frame as the plug-in's property of the same
+    // key in the "Pipeline" domain: the writer a SimulatedDevicePlayer of this
+    // session's simulated device plays with.
+    SimulatedDevicePlayer::StateWriter stateWriter();
 
     // Replaces the key map, and the keyboard its keys go to, between two of
     // the device's events; returns once done. A key the old map holds down is
@@ -104,12 +92,6 @@ private:
     // The host's event queue only, and the destructor once that is drained.
     KeyMap _keyMap;
     KeyboardSink* _keyboard;
-
-    std::thread _player;
-    std::atomic<bool> _stopPlaying{false};
-    std::mutex _playedLock;
-    std::condition_variable _playedChanged;
-    bool _played = false;  // guarded by _playedLock
 };
 
 }  // namespace VeltoHost

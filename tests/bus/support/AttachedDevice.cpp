@@ -1,6 +1,6 @@
 #include "AttachedDevice.h"
 
-#include "recording/PipelineRecording.h"
+#include "recording/SimulatedDevicePlayer.h"
 
 #include <fstream>
 #include <sstream>
@@ -28,5 +28,8 @@ void AttachedDevice::detach() { _session.reset(); }
 std::uint64_t AttachedDevice::play(const std::string& recordingPath)
 {
     const VeltoTouch::PipelineRecording recording{std::string_view(readFile(recordingPath))};
-    return _session->play(recording, _device, 0);
+    VeltoHost::SimulatedDevicePlayer player(_device, _session->stateWriter(), [] { return false; }, {.speed = 0});
+    for (const VeltoTouch::PipelineRecording::Frame& frame : recording.frames()) player.play(frame);
+    player.waitUntilTaken();
+    return player.reportsPushed();
 }
