@@ -1,6 +1,7 @@
 #include "daemon/HostDeviceControl.h"
 
 #include "platform/devices/FileKind.h"
+#include "records/DomainKey.h"
 #include "recording/JsonValue.h"
 #include "service/ServicePropertyKey.h"
 
@@ -20,7 +21,6 @@ namespace VeltoHost {
 namespace {
 
 constexpr const char* kRecordingKey = "Recording";
-constexpr const char* kPipelineDomain = "Pipeline.";
 // Keys that act when written and read as null: commands, not settings.
 constexpr const char* kWriteOnlyKeys[] = {"Pipeline.Algs.ResetEventStats"};
 
@@ -177,7 +177,9 @@ DeviceControl::Result HostDeviceControl::checkWrite(const std::string& key, cons
     if (!value.hasValue()) return Result::invalidArgument("no value given for " + quoted(key));
     // The recogniser's writable settings are all scalars; its dictionaries are
     // counters and diagnostics that a write would silently leave unchanged.
-    if (key.rfind(kPipelineDomain, 0) == 0 && (current.isDictionary() || current.isArray())) {
+    std::string pipelineKey = key;
+    if (VeltoTouch::Util::stripDomainFromKey(pipelineKey, VeltoTouch::kPipelineDomain) &&
+        (current.isDictionary() || current.isArray())) {
         return Result::failed("property " + quoted(key) + " is read-only");
     }
     const std::string wrongKind =
