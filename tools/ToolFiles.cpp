@@ -121,15 +121,14 @@ ToolFiles::File ToolFiles::openRecording(const std::string& path)
     return file;
 }
 
-std::optional<std::uint64_t> ToolFiles::streamRecording(std::FILE* file, const std::string& path,
-                                                        const VeltoTouch::ContainerStream::FrameHandler& onFrame,
-                                                        const std::function<bool()>& stopRequested,
-                                                        std::optional<std::uint32_t> hidDevice)
+std::optional<VeltoTouch::ContainerStream::Format> ToolFiles::streamRecording(
+    std::FILE* file, const std::string& path, const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+    const std::function<bool()>& stopRequested, std::optional<std::uint32_t> hidDevice)
 {
-    std::uint64_t version = 0;
+    VeltoTouch::ContainerStream::Format format;
     try {
         // Read through the descriptor: stdio's buffer is never used.
-        version = VeltoTouch::ContainerReadAhead::read(::fileno(file), onFrame, stopRequested, hidDevice);
+        format = VeltoTouch::ContainerReadAhead::read(::fileno(file), onFrame, stopRequested, hidDevice);
     } catch (const ToolError&) {
         throw;
     } catch (const VeltoTouch::HidRecorderReader::Fault& fault) {
@@ -145,12 +144,12 @@ std::optional<std::uint64_t> ToolFiles::streamRecording(std::FILE* file, const s
         throw ToolError(describeUnreadable(path, read(path), message));
     }
     if (stopRequested && stopRequested()) return std::nullopt;
-    return version;
+    return format;
 }
 
-std::uint64_t ToolFiles::streamRecording(const std::string& path,
-                                         const VeltoTouch::ContainerStream::FrameHandler& onFrame,
-                                         std::optional<std::uint32_t> hidDevice)
+VeltoTouch::ContainerStream::Format ToolFiles::streamRecording(const std::string& path,
+                                                               const VeltoTouch::ContainerStream::FrameHandler& onFrame,
+                                                               std::optional<std::uint32_t> hidDevice)
 {
     const File file = openRecording(path);
     return *streamRecording(file.get(), path, onFrame, {}, hidDevice);

@@ -38,14 +38,14 @@ public:
     // is complete (ContainerStream), so that its length does not matter; the
     // parsing runs on a thread of its own, ahead of onFrame (ContainerReadAhead).
     // Failures as readRecording's, raised where they are reached: the frames
-    // before a fault have been handed over. Returns the container's version,
+    // before a fault have been handed over. Returns what the file was,
     // or nothing when the read ended because a stop was requested (a signal
     // that interrupts a blocked read cuts the input short).
-    static std::optional<std::uint64_t> streamRecording(std::FILE* file, const std::string& path,
+    static std::optional<VeltoTouch::ContainerStream::Format> streamRecording(std::FILE* file, const std::string& path,
                                                         const VeltoTouch::ContainerStream::FrameHandler& onFrame,
                                                         const std::function<bool()>& stopRequested = {},
                                                         std::optional<std::uint32_t> hidDevice = std::nullopt);
-    static std::uint64_t streamRecording(const std::string& path,
+    static VeltoTouch::ContainerStream::Format streamRecording(const std::string& path,
                                          const VeltoTouch::ContainerStream::FrameHandler& onFrame,
                                          std::optional<std::uint32_t> hidDevice = std::nullopt);
 

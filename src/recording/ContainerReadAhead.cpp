@@ -25,14 +25,14 @@ struct Abandoned {};
 
 }  // namespace
 
-std::uint64_t ContainerReadAhead::read(int fd, const ContainerStream::FrameHandler& onFrame,
-                                       const std::function<bool()>& stopRequested,
-                                       std::optional<std::uint32_t> hidDevice)
+ContainerStream::Format ContainerReadAhead::read(int fd, const ContainerStream::FrameHandler& onFrame,
+                                                 const std::function<bool()>& stopRequested,
+                                                 std::optional<std::uint32_t> hidDevice)
 {
     // The player closes it when it gives up, the reader when the input ends.
     VeltoHost::BoundedQueue<Batch> ready(kBatchesAhead);
     // Written by the reader before it closes the queue, read after the join.
-    std::uint64_t version = 0;
+    ContainerStream::Format format;
     std::exception_ptr failure;
 
     std::thread reader([&] {
@@ -41,7 +41,7 @@ std::uint64_t ContainerReadAhead::read(int fd, const ContainerStream::FrameHandl
             if (!batch.empty() && !ready.push(std::exchange(batch, {}))) throw Abandoned{};
         };
         try {
-            version = ContainerStream::read(
+            format = ContainerStream::read(
                 fd,
                 [&](Frame&& frame) {
                     batch.push_back(std::move(frame));
@@ -73,7 +73,7 @@ std::uint64_t ContainerReadAhead::read(int fd, const ContainerStream::FrameHandl
     }
     reader.join();
     if (failure) std::rethrow_exception(failure);
-    return version;
+    return format;
 }
 
 }  // namespace VeltoTouch

@@ -21,7 +21,7 @@ namespace VeltoTouch {
 // the input as if it had been cut short.
 class ContainerReadAhead {
 public:
-    static std::uint64_t read(int fd, const ContainerStream::FrameHandler& onFrame,
+    static ContainerStream::Format read(int fd, const ContainerStream::FrameHandler& onFrame,
                               const std::function<bool()>& stopRequested = {},
                               std::optional<std::uint32_t> hidDevice = std::nullopt);
 };

@@ -539,8 +539,14 @@ private:
 
 }  // namespace
 
-std::uint64_t ContainerStream::read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested,
-                                    std::optional<std::uint32_t> hidDevice)
+std::string ContainerStream::Format::text() const
+{
+    return hidRecorder ? "hid-recorder text" : "container version " + std::to_string(version);
+}
+
+ContainerStream::Format ContainerStream::read(int fd, const FrameHandler& onFrame,
+                                              const std::function<bool()>& stopRequested,
+                                              std::optional<std::uint32_t> hidDevice)
 {
     const off_t start = ::lseek(fd, 0, SEEK_CUR);
     DescriptorInput input(fd, stopRequested);
@@ -561,7 +567,7 @@ std::uint64_t ContainerStream::read(int fd, const FrameHandler& onFrame, const s
         // Cut short by the stop: the last line may be a part of one.
         if (stopRequested && stopRequested()) throw std::runtime_error("the read was stopped");
         reader.finish();
-        return ContainerWriter::kVersion;
+        return {.hidRecorder = true};
     }
     StreamHandler handler(onFrame);
     rapidjson::Reader reader;
@@ -579,7 +585,7 @@ std::uint64_t ContainerStream::read(int fd, const FrameHandler& onFrame, const s
             rejectContainer("invalid container");
         }
     }
-    if (!framesBeforeVersion) return handler.version();
+    if (!framesBeforeVersion) return {.version = handler.version()};
 
     // Read whole, from the start, when the file can be read again.
     if (start < 0 || ::lseek(fd, start, SEEK_SET) != start) {
@@ -603,7 +609,7 @@ std::uint64_t ContainerStream::read(int fd, const FrameHandler& onFrame, const s
         Frame copy = frame;
         onFrame(std::move(copy));
     }
-    return version;
+    return {.version = version};
 }
 
 }  // namespace VeltoTouch

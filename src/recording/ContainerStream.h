@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <functional>
 #include <optional>
+#include <string>
 
 namespace VeltoTouch {
 
@@ -36,13 +37,19 @@ public:
     // exception reaches the caller of read()).
     using FrameHandler = std::function<void(PipelineRecording::Frame&& frame)>;
 
+    // What the file turned out to be, for whoever shows where a recording came from.
+    struct Format {
+        bool hidRecorder = false;  // hid-recorder text rather than a container
+        std::uint64_t version = 0;  // the container's version (0 or 1) as it states it
+        // "container version 1", "hid-recorder text"
+        std::string text() const;
+    };
+
     // Reads from the descriptor's current position to its end; it stays
     // open. When `stopRequested` turns true, the input ends there as if it
     // had been cut short (the caller, who asked, tells a stop from a fault),
-    // also while waiting for input that has not come (a pipe). Returns the
-    // container's version (0 or 1) as it states it; for a hid-recorder text,
-    // the version whose frames it was read into (ContainerWriter::kVersion).
-    static std::uint64_t read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested = {},
+    // also while waiting for input that has not come (a pipe).
+    static Format read(int fd, const FrameHandler& onFrame, const std::function<bool()>& stopRequested = {},
                               std::optional<std::uint32_t> hidDevice = std::nullopt);
 };
 

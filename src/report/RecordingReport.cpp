@@ -87,7 +87,7 @@ struct FrameCounts {
     }
 };
 
-nlohmann::ordered_json facts(const FrameCounts& counts, std::uint64_t containerVersion,
+nlohmann::ordered_json facts(const FrameCounts& counts, const ContainerStream::Format& format,
                              const RecordingReport::Options& options, std::size_t pageFrames)
 {
     const std::optional<std::uint64_t>& first = counts.first;
@@ -100,7 +100,7 @@ nlohmann::ordered_json facts(const FrameCounts& counts, std::uint64_t containerV
     out["pageFrames"] = pageFrames;
     // Nanosecond time stamps pass 2^53 too.
     out["durationNs"] = first && last >= *first ? std::to_string(last - *first) : "0";
-    out["containerVersion"] = std::to_string(containerVersion);
+    out["format"] = format.text();
     out["firstTimestampNs"] = first ? std::to_string(*first) : "";
     out["lastTimestampNs"] = first ? std::to_string(last) : "";
     nlohmann::ordered_json settings = nlohmann::ordered_json::array();
@@ -125,13 +125,13 @@ std::string RecordingReport::html(const FrameSource& frames, const std::shared_p
         ReportCollector collector(*pipeline, options.frames);
         FrameCounts counts;
         PipelineRecording::PlayClock clock;
-        const std::uint64_t containerVersion = frames([&](PipelineRecording::Frame&& frame) {
+        const ContainerStream::Format format = frames([&](PipelineRecording::Frame&& frame) {
             if (!counts.first) clock.reset();
             counts.add(frame);
             PipelineRecording::playFrame(frame, clock, *counts.first, 1.0f, {}, pipeline.get());
         });
         payload = collector.payload();
-        payload["facts"] = facts(counts, containerVersion, options, collector.frameCount());
+        payload["facts"] = facts(counts, format, options, collector.frameCount());
     }
     payload["title"] = options.title;
     payload["counters"] = countersAsText(JsonValue::toJson(pipeline->getState("Algs.EventStats")));

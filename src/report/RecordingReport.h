@@ -1,6 +1,7 @@
 #pragma once
 
 #include "pipeline/Pipeline.h"
+#include "recording/ContainerStream.h"
 #include "recording/PipelineRecording.h"
 #include "report/ReportCollector.h"
 
@@ -32,10 +33,10 @@ public:
     };
 
     // Hands every frame of a recording, in order, to the function it is given
-    // (ToolFiles::streamRecording reading a file) and returns the version of
-    // the recording's container, which the page shows among its facts.
+    // (ToolFiles::streamRecording reading a file) and returns what the file
+    // was, which the page shows among its facts.
     using FrameSource =
-        std::function<std::uint64_t(const std::function<void(PipelineRecording::Frame&&)>& play)>;
+        std::function<ContainerStream::Format(const std::function<void(PipelineRecording::Frame&&)>& play)>;
 
     // Plays every frame through `pipeline` (already set up by the caller) as
     // fast as possible, as the source hands them over, and returns the page.

@@ -49,7 +49,8 @@ TEST(ContainerReadAhead, HandsOverWhatTheStreamReadsInOrderThenItsFault)
         PipelineRecording::FrameList ahead;
         std::string aheadError;
         try {
-            EXPECT_EQ(ContainerReadAhead::read(file.fd(), [&](Frame&& frame) { ahead.push_back(std::move(frame)); }), 1u);
+            EXPECT_EQ(ContainerReadAhead::read(file.fd(), [&](Frame&& frame) { ahead.push_back(std::move(frame)); }).text(),
+                      "container version 1");
         } catch (const std::exception& error) {
             aheadError = error.what();
         }

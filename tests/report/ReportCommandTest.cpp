@@ -69,6 +69,11 @@ TEST(ReportCommandTest, FramesLimitThePageToTheirFramesAndEvents)
     EXPECT_EQ(payload["title"], "</script><b>{{data}}</b>");
     EXPECT_EQ(payload["facts"]["settings"], nlohmann::json::parse(R"([["Algs.HoldTimeoutMilliseconds","600"]])"));
     EXPECT_EQ(html.find("<b>"), std::string::npos) << "the title reached the page unescaped";
+    EXPECT_EQ(payload["facts"]["format"], "container version 1");
+
+    const fs::path captured = dir.file("captured.html");
+    ASSERT_EQ(runTool({"report", kExamples + "/hid-recorder-two-devices.hid", "-o", captured}).status, 0);
+    EXPECT_EQ(payloadOf(readFile(captured))["facts"]["format"], "hid-recorder text");
 }
 
 TEST(ReportCommandTest, BadInputIsRefusedWithAMessage)

@@ -877,7 +877,7 @@
       ['state-frames', 'State frames', String(facts.stateFrames)],
       ['page-frames', 'Recogniser frames shown', String(facts.pageFrames) + (facts.frameRange ? ' (frames ' + facts.frameRange + ')' : '')],
       ['duration', 'Duration', seconds.toFixed(3) + ' s'],
-      ['container-version', 'Container version', facts.containerVersion],
+      ['format', 'Format', facts.format],
       ['first-timestamp', 'First time stamp (ns)', facts.firstTimestampNs],
       ['last-timestamp', 'Last time stamp (ns)', facts.lastTimestampNs],
       ['ignored-reports', 'Reports not understood', String(data.ignoredReports)],
