@@ -352,15 +352,12 @@ void BM_UhidToHidraw(benchmark::State& state)
 {
     const TapRun run = tapRun(static_cast<int>(state.range(0)));
     const std::int64_t spacing = state.range(1);
+    // Both runs time the taps' reports; without keys there is nothing to time.
+    if (run.keys == 0) return state.SkipWithError("examples/taps.json brought no key");
     for (auto _ : state) {
         const int uhid = openUhid(state);
         if (uhid < 0) return;
         UhidDevice::Identity identity = emulatedSurface();
-        if (run.keys == 0) {
-            ::close(uhid);
-            state.SkipWithError("examples/taps.json brought no key");
-            return;
-        }
         identity.name = "VeltoTouch latency floor " + std::to_string(::getpid());
         identity.product = kFloorProduct;
         UhidDevice device(uhid, nullptr);
@@ -432,15 +429,12 @@ void BM_ReportToKey(benchmark::State& state)
 {
     const TapRun run = tapRun(static_cast<int>(state.range(0)));
     const std::int64_t spacing = state.range(1);
+    // Both runs time the taps' reports; without keys there is nothing to time.
+    if (run.keys == 0) return state.SkipWithError("examples/taps.json brought no key");
     for (auto _ : state) {
         const int uhid = openUhid(state);
         if (uhid < 0) return;
         UhidDevice::Identity identity = emulatedSurface();
-        if (run.keys == 0) {
-            ::close(uhid);
-            state.SkipWithError("examples/taps.json brought no key");
-            return;
-        }
         const int keyboard = openKeyboard();
         if (keyboard < 0) {
             ::close(uhid);
