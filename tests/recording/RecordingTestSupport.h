@@ -57,13 +57,10 @@ inline Frame reportFrame(std::uint64_t timestampNs, std::vector<std::uint8_t> by
 // file in memory (seekable, like a file on disk).
 inline PipelineRecording::FrameList streamFrames(const std::string& text, std::size_t* handedBeforeFault = nullptr)
 {
-    const std::unique_ptr<std::FILE, int (*)(std::FILE*)> file(std::tmpfile(), &std::fclose);
-    std::fwrite(text.data(), 1, text.size(), file.get());
-    std::fflush(file.get());
-    ::lseek(::fileno(file.get()), 0, SEEK_SET);
+    const TempFile file(text);
     PipelineRecording::FrameList frames;
     try {
-        VeltoTouch::ContainerStream::read(::fileno(file.get()), [&](Frame&& frame) { frames.push_back(std::move(frame)); });
+        VeltoTouch::ContainerStream::read(file.fd(), [&](Frame&& frame) { frames.push_back(std::move(frame)); });
     } catch (...) {
         if (handedBeforeFault) *handedBeforeFault = frames.size();
         throw;

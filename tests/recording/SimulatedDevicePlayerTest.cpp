@@ -22,14 +22,9 @@ using VeltoTouch::PipelineRecording;
 
 namespace {
 
-PipelineRecording::Frame report(std::uint8_t id, std::uint64_t timestampNs)
-{
-    PipelineRecording::Frame frame;
-    frame.type = PipelineRecording::Frame::Type::InputReport;
-    frame.timestampNs = timestampNs;
-    frame.report = {id};
-    return frame;
-}
+using namespace RecordingTestSupport;
+
+PipelineRecording::Frame report(std::uint8_t id, std::uint64_t timestampNs) { return reportFrame(timestampNs, {id}); }
 
 // Hands over the frames, then raises `fault` unless it is empty.
 SimulatedDevicePlayer::FrameSource frames(std::vector<PipelineRecording::Frame> list, std::string fault = "")
@@ -40,8 +35,6 @@ SimulatedDevicePlayer::FrameSource frames(std::vector<PipelineRecording::Frame> 
         if (!fault.empty()) throw std::invalid_argument(fault);
     };
 }
-
-using RecordingTestSupport::TempFile;
 
 SimulatedDevicePlayer atSpeedZero(const SimulatedHostDevice::Ref& device,
                                   std::function<bool()> stop = [] { return false; })
@@ -70,24 +63,12 @@ TEST(SimulatedDevicePlayerTest, AStopRequestEndsEveryWait)
     // A gap of a year, and a state write that waits for a report nobody takes:
     // both return once the stop is requested.
     EXPECT_FALSE(player.play(report(2, 365ull * 24 * 3600 * 1'000'000'000ull)));
-    PipelineRecording::Frame state;
-    state.type = PipelineRecording::Frame::Type::State;
-    state.key = "K";
-    state.value = PropertyValue::uint32(1);
-    EXPECT_FALSE(player.play(state));
+    EXPECT_FALSE(player.play(stateFrame(0, "K", PropertyValue::uint32(1))));
     EXPECT_FALSE(player.waitUntilTaken());
     stopper.join();
     EXPECT_EQ(player.reportsPushed(), 1u);
     ASSERT_EQ(notices.size(), 1u);
     EXPECT_NE(notices[0].find("--max-gap"), std::string::npos);
-}
-
-TEST(SimulatedDevicePlayerTest, ASimulatedDeviceNameIsItsRecordingAfterThePrefix)
-{
-    EXPECT_EQ(SimulatedDevicePlayer::recordingPath("sim:a/b.json"), "a/b.json");
-    EXPECT_EQ(SimulatedDevicePlayer::recordingPath("sim:"), "");
-    EXPECT_EQ(SimulatedDevicePlayer::recordingPath("/dev/hidraw0"), std::nullopt);
-    EXPECT_EQ(SimulatedDevicePlayer::recordingPath("x:sim:a"), std::nullopt);
 }
 
 TEST(SimulatedDevicePlayerTest, AStreamIsPlayedAsItArrivesAndItsFaultComesAfterTheFramesBeforeIt)

@@ -1,4 +1,3 @@
-#include "platform/devices/HostDeviceRegistry.h"
 #include "platform/devices/SimulatedHostDevice.h"
 #include "platform/runtime/RunLoop.h"
 #include "platform/runtime/Semaphore.h"
@@ -96,19 +95,4 @@ TEST(SimulatedHostDeviceTest, DeliversPushedReportsInOrderOnTheLoopThread)
     // Unscheduled: a new report waits again.
     device->pushInputReport({7});
     EXPECT_EQ(device->pendingReportCount(), 1u);
-}
-
-TEST(HostDeviceRegistryTest, ServiceHandlesFindTheirDevices)
-{
-    HostDeviceRegistry& registry = HostDeviceRegistry::shared();
-    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
-    std::uint32_t service = registry.add(device);
-    EXPECT_NE(service, 0u);
-    const std::uint32_t again = registry.add(device);
-    EXPECT_NE(again, service);
-    EXPECT_EQ(HostDevice::createWithService(service), device);
-    registry.remove(service);
-    registry.remove(again);
-    EXPECT_EQ(HostDevice::createWithService(service), nullptr);
-    EXPECT_EQ(HostDevice::createWithService(0), nullptr);
 }

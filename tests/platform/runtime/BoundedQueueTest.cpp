@@ -92,11 +92,3 @@ TEST(BoundedQueueTest, ACloseWakesAConsumerWaitingOnAnEmptyQueue)
     consumer.join();
     EXPECT_FALSE(taken.has_value());
 }
-
-TEST(BoundedQueueTest, ACapacityOfZeroHoldsOneItem)
-{
-    BoundedQueue<int> queue(0);
-    EXPECT_EQ(queue.capacity(), 1u);
-    ASSERT_TRUE(queue.push(5));
-    EXPECT_EQ(queue.pop(), 5);
-}
