@@ -105,8 +105,10 @@ TEST_F(BusServiceTest, SettingsRoundTripAsJsonWhileReportsFlow)
     EXPECT_EQ(tapsCounted(*_client, device.path()), 0u);
 }
 
-// A value that is not JSON, an unknown key read and an absent device are
-// refused through `ctl` against the real daemon as well.
+// Refused through `ctl` against the real daemon, and not again here: a value
+// that is not JSON, a read-only Version, a number beyond a double and a value
+// over the size limit (DaemonCommandTest), a string for a number (README's
+// example, ReadmeExamplesTest).
 TEST_F(BusServiceTest, MalformedRequestsAreRefusedWhileTheDeviceKeepsRecognising)
 {
     AttachedDevice& device = attach("sim:taps.json");
@@ -123,16 +125,12 @@ TEST_F(BusServiceTest, MalformedRequestsAreRefusedWhileTheDeviceKeepsRecognising
         const char* error;
     };
     const std::vector<Case> cases = {
-        {"value with trailing text", path, "SetProperty", {"Pipeline.Algs.ActivationThreshold", "200 300"},
-         BusService::kErrorInvalidJson},
         {"empty value", path, "SetProperty", {"Pipeline.Algs.ActivationThreshold", ""}, BusService::kErrorInvalidJson},
         {"unknown key written", path, "SetProperty", {"Pipeline.Algs.NoSuchSetting", "1"},
          BusService::kErrorInvalidArgument},
         {"key in another case", path, "SetProperty", {"Pipeline.Algs.activationthreshold", "1"},
          BusService::kErrorInvalidArgument},
         {"empty key", path, "GetProperty", {""}, BusService::kErrorInvalidArgument},
-        {"string for a number", path, "SetProperty", {"Pipeline.Algs.ActivationThreshold", "\"high\""},
-         BusService::kErrorInvalidArgument},
         {"object for a flag", path, "SetProperty", {"Pipeline.Algs.EnableTapSuppression", "{}"},
          BusService::kErrorInvalidArgument},
         {"negative timeout", path, "SetProperty", {"Pipeline.Algs.HoldTimeoutMilliseconds", "-1"},
@@ -143,16 +141,10 @@ TEST_F(BusServiceTest, MalformedRequestsAreRefusedWhileTheDeviceKeepsRecognising
          BusService::kErrorInvalidArgument},
         {"counters are read-only", path, "SetProperty", {kCounters, "{}"}, BusService::kErrorFailed},
         {"device refuses the write", path, "SetProperty", {"Product", "\"renamed\""}, BusService::kErrorFailed},
-        {"version is read-only", path, "SetProperty", {"Version", "[9,9,9]"}, BusService::kErrorFailed},
         {"recording is read-only", path, "SetProperty", {"Recording", "\"x\""}, BusService::kErrorFailed},
         {"debug dictionary is read-only", path, "SetProperty", {"ServicePluginDebug", "{}"}, BusService::kErrorFailed},
-        {"number beyond a double", path, "SetProperty", {"Pipeline.Algs.ActivationThreshold", "1e400"},
-         BusService::kErrorInvalidArgument},
         {"nested too deep", path, "SetProperty",
          {"Pipeline.Algs.ActivationThreshold", std::string(1000, '[') + std::string(1000, ']')},
-         BusService::kErrorInvalidArgument},
-        {"value larger than any setting", path, "SetProperty",
-         {"Pipeline.Algs.ActivationThreshold", std::string(BusService::kMaxValueBytes + 1, '1')},
          BusService::kErrorInvalidArgument},
         {"a path where a file is passed", path, "SaveRecording", {"/tmp/out.json"}, kInvalidArgs},
         {"absent device written", absent, "SetProperty", {"Pipeline.Algs.ActivationThreshold", "1"}, kUnknownObject},

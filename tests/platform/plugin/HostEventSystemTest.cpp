@@ -141,10 +141,8 @@ TEST(HostEventSystemTest, StartFailuresRaiseClearErrorsAndUndoEverything)
     SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
     HostEventSystem host;
 
-    std::string error = runtimeErrorOf(host, "/nonexistent/velto_plugin.so", kEchoFactory, device);
-    EXPECT_NE(error.find("cannot load plug-in module /nonexistent/velto_plugin.so"), std::string::npos) << error;
-
-    error = runtimeErrorOf(host, kEchoPluginPath, "VeltoTouchHIDServiceFactory", device);
+    // A module that cannot be loaded is named through `host --plugin`.
+    std::string error = runtimeErrorOf(host, kEchoPluginPath, "VeltoTouchHIDServiceFactory", device);
     EXPECT_NE(error.find("factory VeltoTouchHIDServiceFactory not found"), std::string::npos) << error;
 
     error = runtimeErrorOf(host, kEchoPluginPath, "VeltoEchoPluginOnlyFactory", device);
