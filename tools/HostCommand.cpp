@@ -17,6 +17,7 @@
 #include "platform/values/PropertyDictionary.h"
 #include "recording/PipelineRecording.h"
 #include "recording/SimulatedDevicePlayer.h"
+#include "service/VeltoTouchHIDServiceFactory.h"
 
 #include <cerrno>
 #include <chrono>
@@ -34,7 +35,6 @@ using VeltoTouch::PipelineRecording;
 
 namespace {
 
-constexpr const char* kFactoryName = "VeltoTouchHIDServiceFactory";
 constexpr const char* kCountersKey = "Pipeline.Algs.EventStats";
 // Waits are cut into slices this long so that a signal ends them promptly.
 constexpr std::uint64_t kWaitSliceMicroseconds = 20'000;
@@ -79,10 +79,8 @@ Device openDevice(const std::string& name)
         device.device = device.simulated;
         return device;
     }
-    const std::string whatElse = VeltoHost::HidrawNode::whatElse(name);
-    if (!whatElse.empty()) {
-        throw ToolError(name + " " + whatElse + "; expected a hidraw device node (/dev/hidrawN) or sim:FILE");
-    }
+    const std::string refusal = VeltoHost::HidrawNode::refusal(name, VeltoHost::SimulatedDevicePlayer::kOrRecording);
+    if (!refusal.empty()) throw ToolError(refusal);
     device.device = std::make_shared<VeltoHost::HidrawHostDevice>(name);
     return device;
 }
@@ -112,7 +110,7 @@ int HostCommand::run(const Options& options, std::ostream& out, std::ostream& er
         std::lock_guard guard(outputLock);
         out << formatter.format(*event) << std::endl;
     });
-    host.start(plugin, kFactoryName, device.device);
+    host.start(plugin, kVeltoTouchHIDServiceFactoryName, device.device);
 
     for (const auto& [key, text, value] : options.settings) {
         if (!host.setProperty(key, value)) {

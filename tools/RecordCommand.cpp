@@ -163,9 +163,7 @@ int RecordCommand::run(const Options& options, std::ostream& err)
 int RecordCommand::run(const Options& options, const StopCheck& stopRequested, std::ostream& err)
 {
     const std::string device = options.device.empty() ? findSurface(options.config) : options.device;
-    if (const std::string whatElse = VeltoHost::HidrawNode::whatElse(device); !whatElse.empty()) {
-        throw ToolError(device + " " + whatElse + "; expected a hidraw device node (/dev/hidrawN)");
-    }
+    if (const std::string refusal = VeltoHost::HidrawNode::refusal(device); !refusal.empty()) throw ToolError(refusal);
     // Read-only: the capture sends the device nothing, and a reader needs no more.
     const int fd = ::open(device.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
     if (fd < 0) throw ToolError(device + ": cannot open: " + std::strerror(errno));

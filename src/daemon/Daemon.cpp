@@ -268,9 +268,8 @@ void Daemon::attachGivenPath(const std::string& path)
 {
     // Anything else would open without complaint and deliver nothing, or
     // garbage, for as long as the service runs.
-    const std::string whatElse = HidrawNode::whatElse(path);
-    if (!whatElse.empty()) {
-        _log.error("%s %s; expected a hidraw device node (/dev/hidrawN) or sim:FILE", path, whatElse);
+    if (const std::string refusal = HidrawNode::refusal(path, SimulatedDevicePlayer::kOrRecording); !refusal.empty()) {
+        _log.error("%s", refusal);
         return;
     }
     DeviceWatcher::Device given;

@@ -39,6 +39,8 @@ public:
 
     // A device named "sim:FILE" on a command line is FILE played through this class.
     static constexpr std::string_view kDevicePrefix = "sim:";
+    // What a program that plays such devices adds to HidrawNode::refusal.
+    static constexpr std::string_view kOrRecording = " or sim:FILE";
     // A state frame's key is the pipeline's own; the plug-in has it under
     // this prefix, which the StateWriter puts before it.
     static constexpr std::string_view kStateDomain = "Pipeline.";

@@ -41,4 +41,11 @@ std::string HidrawNode::whatElse(const std::string& path)
     return "is a character device of the \"" + std::string(subsystem) + "\" subsystem (" + number + ")";
 }
 
+std::string HidrawNode::refusal(const std::string& path, std::string_view orElse)
+{
+    const std::string what = whatElse(path);
+    if (what.empty()) return what;
+    return path + " " + what + "; expected a hidraw device node (/dev/hidrawN)" + std::string(orElse);
+}
+
 }  // namespace VeltoHost

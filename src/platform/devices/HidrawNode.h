@@ -1,6 +1,7 @@
 #pragma once
 
 #include <string>
+#include <string_view>
 
 namespace VeltoHost {
 
@@ -17,6 +18,10 @@ public:
     // as the end of a sentence that starts with the path: "is a regular file",
     // "is a character device of the \"mem\" subsystem", "does not exist".
     static std::string whatElse(const std::string& path);
+    // Empty when `path` is a hidraw node; otherwise the line refusing it:
+    // "PATH is a regular file; expected a hidraw device node (/dev/hidrawN)",
+    // then `orElse` for a program that takes something besides.
+    static std::string refusal(const std::string& path, std::string_view orElse = {});
 };
 
 }  // namespace VeltoHost
