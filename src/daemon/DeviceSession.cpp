@@ -1,5 +1,7 @@
 #include "daemon/DeviceSession.h"
 
+#include "service/VeltoTouchHIDServiceFactory.h"
+
 #include <stdexcept>
 #include <utility>
 
@@ -7,7 +9,6 @@ namespace VeltoHost {
 
 namespace {
 
-constexpr const char* kFactoryName = "VeltoTouchHIDServiceFactory";
 // Events kept for the bus while the device's object is being made: more
 // than a few seconds of touches; the object takes milliseconds.
 constexpr std::size_t kMaxEventsBeforeBusObject = 256;
@@ -23,7 +24,7 @@ DeviceSession::DeviceSession(std::string name, HostDevice::Ref device, const std
     // listener to every device may well be there already (a surface that
     // resets as it is plugged in sends its reset at once).
     _subscription = _host.subscribe([this](const HidEventRef& event) { onEvent(event); });
-    _host.start(pluginPath, kFactoryName, std::move(device));
+    _host.start(pluginPath, kVeltoTouchHIDServiceFactoryName, std::move(device));
     _control = std::make_shared<HostDeviceControl>(_name, _host);
     if (!_outputs.bus) return;
     try {

@@ -8,3 +8,7 @@
 // allocator is ignored.
 extern "C" __attribute__((visibility("default"))) VeltoHost::VeltoInterfaceRef
 VeltoTouchHIDServiceFactory(void* allocator, VeltoHost::VeltoUUID typeID);
+
+// The name a host looks the entry point up by, for hosts that load the module
+// rather than link it (the daemon, the tool's host command).
+inline constexpr const char* kVeltoTouchHIDServiceFactoryName = "VeltoTouchHIDServiceFactory";
