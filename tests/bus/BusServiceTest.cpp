@@ -20,7 +20,6 @@
 #include <optional>
 #include <stdexcept>
 #include <string>
-#include <thread>
 #include <vector>
 
 using namespace VeltoHost;
@@ -65,45 +64,10 @@ protected:
 }  // namespace
 
 // Listing, numbering and the manager's announcements are checked on the
-// daemon, which adds and removes devices as they come and go.
-
-TEST_F(BusServiceTest, SettingsRoundTripAsJsonWhileReportsFlow)
-{
-    AttachedDevice& device = attach("sim:taps.json");
-    std::thread player([&] {
-        for (int round = 0; round < 3; ++round) device.play(example("taps.json"));
-    });
-
-    struct Case {
-        const char* key;
-        const char* written;
-        const char* readBack;
-    };
-    const Case cases[] = {
-        {"Pipeline.Algs.ActivationThreshold", "212.5", "212.5"},
-        {"Pipeline.Algs.EnableTapSuppression", "false", "false"},
-        {"Pipeline.Algs.EnableHoldSuppression", "0", "false"},
-        {"Pipeline.Algs.VirtualNormalizationFactors.7", "0.5", "0.5"},
-    };
-    for (const Case& c : cases) {
-        const ControlClient::Reply written = _client->setProperty(device.path(), c.key, c.written);
-        EXPECT_EQ(written.error, "") << c.key << ": " << written.message;
-        const ControlClient::Reply read = _client->getProperty(device.path(), c.key);
-        EXPECT_EQ(read.error, "") << c.key << ": " << read.message;
-        EXPECT_EQ(read.value, c.readBack) << c.key;
-    }
-    player.join();
-
-    // "Recording" is a text property (the container's JSON), so its value
-    // arrives as a JSON string holding that text.
-    const PropertyValue recording = VeltoTouch::JsonValue::parse(_client->getProperty(device.path(), "Recording").value,
-                                                                 VeltoTouch::JsonValue::TopLevel::AnyValue);
-    ASSERT_TRUE(recording.isString());
-    EXPECT_NO_THROW(VeltoTouch::PipelineRecording{std::string_view(recording.asString())});
-    // A reset command is write-only: it reads as nothing, yet it is taken.
-    EXPECT_EQ(_client->setProperty(device.path(), "Pipeline.Algs.ResetEventStats", "null").error, "");
-    EXPECT_EQ(tapsCounted(*_client, device.path()), 0u);
-}
+// daemon, which adds and removes devices as they come and go; settings
+// written and read back as JSON through ctl (DaemonCommandTest, README's
+// examples), with what the pipeline makes of each kind of value
+// (fuzz_pipeline) and how JSON is written (JsonValueTest).
 
 // Refused through `ctl` against the real daemon, and not again here: a value
 // that is not JSON, a read-only Version, a number beyond a double and a value
