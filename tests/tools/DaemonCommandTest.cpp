@@ -133,6 +133,13 @@ ToolProcess::Result stop(ToolProcess& process, int signal)
     return process.finish(kDeadline);
 }
 
+// Each test on a private bus of its own.
+class DaemonCommandTest : public ::testing::Test {
+protected:
+    void SetUp() override { ASSERT_FALSE(bus.address().empty()) << bus.error(); }
+    PrivateBus bus;
+};
+
 // The resident memory of a process, in kilobytes.
 long residentKilobytes(pid_t pid)
 {
@@ -145,10 +152,8 @@ long residentKilobytes(pid_t pid)
 
 }  // namespace
 
-TEST(DaemonCommandTest, TwoSimulatedDevicesServedToCtlAndSignalsAsReplaySeesThem)
+TEST_F(DaemonCommandTest, TwoSimulatedDevicesServedToCtlAndSignalsAsReplaySeesThem)
 {
-    PrivateBus bus;
-    ASSERT_FALSE(bus.address().empty()) << bus.error();
     const std::vector<std::string> files{kExamples + "/taps.json", kExamples + "/reset-mid-hold.json"};
 
     // Nobody serves the name yet.
@@ -226,16 +231,13 @@ TEST(DaemonCommandTest, TwoSimulatedDevicesServedToCtlAndSignalsAsReplaySeesThem
     }
     EXPECT_EQ(ctl(bus, {"get", "-d", "1", "Pipeline.Algs.HoldTimeoutMilliseconds"}).status, 0);
 
-    daemon.signal(SIGTERM);
-    const ToolProcess::Result ended = daemon.finish(kDeadline);
+    const ToolProcess::Result ended = stop(daemon, SIGTERM);
     ASSERT_TRUE(ended.exited) << "ended by signal " << ended.signal << "\n" << ended.err;
     EXPECT_EQ(ended.status, 0) << ended.err;
 }
 
-TEST(DaemonCommandTest, ADaemonThatLosesItsBusEndsWithAFailureForItsServiceManager)
+TEST_F(DaemonCommandTest, ADaemonThatLosesItsBusEndsWithAFailureForItsServiceManager)
 {
-    PrivateBus bus;
-    ASSERT_FALSE(bus.address().empty()) << bus.error();
     TempDir dir;
     const NotifySocket systemd(dir.file("notify"));
     ToolProcess daemon(daemonArguments(bus, {kExamples + "/taps.json"}, "0"), systemd.setup());
@@ -249,10 +251,8 @@ TEST(DaemonCommandTest, ADaemonThatLosesItsBusEndsWithAFailureForItsServiceManag
         << ended.err;
 }
 
-TEST(DaemonCommandTest, BadDevicesAreNamedAndLeftOutAndWithNothingToServeTheDaemonEnds)
+TEST_F(DaemonCommandTest, BadDevicesAreNamedAndLeftOutAndWithNothingToServeTheDaemonEnds)
 {
-    PrivateBus bus;
-    ASSERT_FALSE(bus.address().empty()) << bus.error();
     TempDir dir;
     const std::string bad = dir.file("bad.json", "not a recording").string();
     const std::vector<std::string> badDevices{"--device", "/dev/null", "--device", "sim:" + bad};
@@ -266,8 +266,7 @@ TEST(DaemonCommandTest, BadDevicesAreNamedAndLeftOutAndWithNothingToServeTheDaem
     ToolProcess daemon(daemonArguments(bus, {kExamples + "/taps.json"}, "0") + badDevices, systemd.setup());
     ASSERT_EQ(systemd.next(), "READY=1");
     EXPECT_EQ(ctl(bus, {"devices"}).out, "0  sim:" + kExamples + "/taps.json\n");
-    daemon.signal(SIGTERM);
-    const ToolProcess::Result served = daemon.finish(kDeadline);
+    const ToolProcess::Result served = stop(daemon, SIGTERM);
     EXPECT_EQ(served.status, 0) << served.err;
     for (const std::string& refusal : refusals) EXPECT_NE(served.err.find(refusal), std::string::npos) << served.err;
 
@@ -295,10 +294,8 @@ TEST(DaemonCommandTest, BadDevicesAreNamedAndLeftOutAndWithNothingToServeTheDaem
     }
 }
 
-TEST(DaemonCommandTest, SighupReloadsTheConfigurationAndABadFileLeavesThePreviousOneInForce)
+TEST_F(DaemonCommandTest, SighupReloadsTheConfigurationAndABadFileLeavesThePreviousOneInForce)
 {
-    PrivateBus bus;
-    ASSERT_FALSE(bus.address().empty()) << bus.error();
     TempDir dir;
     const std::string config = dir.file("veltotouch.toml", "log_level = \"error\"\n").string();
     const NotifySocket systemd(dir.file("notify"));
@@ -323,8 +320,7 @@ TEST(DaemonCommandTest, SighupReloadsTheConfigurationAndABadFileLeavesThePreviou
         EXPECT_EQ(systemd.next(), "READY=1");
         EXPECT_EQ(ctl(bus, {"devices"}).out, "0  sim:" + kExamples + "/taps.json\n");
     }
-    daemon.signal(SIGTERM);
-    const ToolProcess::Result ended = daemon.finish(kDeadline);
+    const ToolProcess::Result ended = stop(daemon, SIGTERM);
     ASSERT_TRUE(ended.exited) << "ended by signal " << ended.signal << "\n" << ended.err;
     EXPECT_EQ(ended.status, 0) << ended.err;
     for (const auto& reload : reloads) EXPECT_NE(ended.err.find(reload.logged), std::string::npos) << ended.err;
@@ -332,10 +328,8 @@ TEST(DaemonCommandTest, SighupReloadsTheConfigurationAndABadFileLeavesThePreviou
     EXPECT_NE(ended.err.find("] default: stopping: taking 1 devices apart\n"), std::string::npos) << ended.err;
 }
 
-TEST(DaemonCommandTest, CtlEventsEndWhenTheDaemonStopsUnlessFollowedIntoTheNextOne)
+TEST_F(DaemonCommandTest, CtlEventsEndWhenTheDaemonStopsUnlessFollowedIntoTheNextOne)
 {
-    PrivateBus bus;
-    ASSERT_FALSE(bus.address().empty()) << bus.error();
     const std::string demo = kExamples + "/demo.json";
     auto first = startDaemon(bus, demo);
 
@@ -366,10 +360,8 @@ TEST(DaemonCommandTest, CtlEventsEndWhenTheDaemonStopsUnlessFollowedIntoTheNextO
     stop(*second, SIGTERM);
 }
 
-TEST(DaemonCommandTest, CtlWritesThatCannotHoldAreToldAndLargeValuesCostTheDaemonNothing)
+TEST_F(DaemonCommandTest, CtlWritesThatCannotHoldAreToldAndLargeValuesCostTheDaemonNothing)
 {
-    PrivateBus bus;
-    ASSERT_FALSE(bus.address().empty()) << bus.error();
     auto daemon = startDaemon(bus, kExamples + "/taps.json");
 
     struct Case {

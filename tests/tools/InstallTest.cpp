@@ -9,6 +9,7 @@
 #include <optional>
 #include <regex>
 #include <sstream>
+#include <utility>
 
 using namespace VeltoTool::Testing;
 
@@ -21,6 +22,13 @@ ToolProcess::Result install(const fs::path& root)
     ToolProcess process({"--install", VELTO_BUILD_DIR},
                         ProcessSetup::copy(VELTO_CMAKE_COMMAND, {"DESTDIR=" + root.string()}));
     return process.finish(kDeadline);
+}
+
+// The unit file as installed under `root`, and the prefix it lies under.
+std::pair<fs::path, std::string> installedUnit(const fs::path& root)
+{
+    const fs::path prefix = root / fs::path(VELTO_INSTALL_PREFIX).relative_path();
+    return {prefix, readFile(prefix / "lib/systemd/system/veltotouch.service")};
 }
 
 std::optional<fs::path> systemdAnalyze()
@@ -48,8 +56,7 @@ TEST(InstallTest, TheServiceFilesLandWhereTheUnitLooksAndTheConfigurationIsKept)
     const ToolProcess::Result first = install(root.path());
     ASSERT_TRUE(first.exited && first.status == 0) << first.out << first.err;
 
-    const fs::path prefix = root.path() / fs::path(VELTO_INSTALL_PREFIX).relative_path();
-    const std::string unit = readFile(prefix / "lib/systemd/system/veltotouch.service");
+    const auto [prefix, unit] = installedUnit(root.path());
     std::smatch exec;
     ASSERT_TRUE(std::regex_search(unit, exec, std::regex("\nExecStart=(/\\S+) daemon --config (/\\S+)\n"))) << unit;
     const fs::path program = root.path() / fs::path(exec[1].str()).relative_path();
@@ -92,8 +99,7 @@ TEST(InstallTest, TheInstalledUnitLoadsCleanlyAndStaysConfined)
 
     // verify wants the program where ExecStart names it, so that path moves
     // into the scratch root; nothing else changes.
-    const fs::path prefix = root.path() / fs::path(VELTO_INSTALL_PREFIX).relative_path();
-    const std::string unit = readFile(prefix / "lib/systemd/system/veltotouch.service");
+    const std::string unit = installedUnit(root.path()).second;
     std::smatch exec;
     ASSERT_TRUE(std::regex_search(unit, exec, std::regex("\nExecStart=(/\\S+) "))) << unit;
     const std::string relocated = exec.prefix().str() + "\nExecStart=" +

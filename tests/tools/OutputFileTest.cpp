@@ -12,7 +12,6 @@
 
 #include <chrono>
 #include <csignal>
-#include <functional>
 #include <set>
 #include <string>
 #include <thread>
@@ -50,23 +49,15 @@ TEST(OutputFile, AnOutputThatIsAnInputIsRefusedAndTheInputKept)
     struct Case {
         std::string input;
         std::string output;  // "input", or a link to it made here
-        std::function<std::vector<std::string>(const std::string& input, const std::string& output)> arguments;
+        std::vector<std::string> arguments;  // IN and OUT stand for the two paths
         // What the refusal calls the input and the output.
         std::string inputIs, outputIs;
     };
     const Case cases[] = {
-        {taps, "input", [](auto in, auto out) { return std::vector<std::string>{"report", in, "-o", out}; }, "input",
-         "output"},
-        {taps, "symlink",
-         [](auto in, auto out) {
-             return std::vector<std::string>{"host", "--device", "sim:" + in, "--speed", "0", "--save-recording", out};
-         },
-         "input", "output"},
-        {"tap top", "hardlink",
-         [](auto in, auto out) { return std::vector<std::string>{"synth", "@" + in, "-o", out}; }, "input", "output"},
-        {taps, "symlink",
-         [](auto in, auto out) { return std::vector<std::string>{"synth", "tap top", "-o", in, "--truth", out}; },
-         "recording", "truth"},
+        {taps, "input", {"report", "IN", "-o", "OUT"}, "input", "output"},
+        {taps, "symlink", {"host", "--device", "sim:IN", "--speed", "0", "--save-recording", "OUT"}, "input", "output"},
+        {"tap top", "hardlink", {"synth", "@IN", "-o", "OUT"}, "input", "output"},
+        {taps, "symlink", {"synth", "tap top", "-o", "IN", "--truth", "OUT"}, "recording", "truth"},
     };
     for (const Case& c : cases) {
         TempDir dir;
@@ -74,9 +65,14 @@ TEST(OutputFile, AnOutputThatIsAnInputIsRefusedAndTheInputKept)
         const fs::path output = dir.path() / c.output;
         if (c.output == "symlink") fs::create_symlink("input", output);
         if (c.output == "hardlink") fs::create_hard_link(input, output);
-        SCOPED_TRACE(c.arguments("", "")[0] + " -> " + c.output);
+        SCOPED_TRACE(c.arguments[0] + " -> " + c.output);
+        std::vector<std::string> arguments = c.arguments;
+        for (std::string& argument : arguments) {
+            if (const auto at = argument.find("IN"); at != std::string::npos) argument.replace(at, 2, input.string());
+            if (argument == "OUT") argument = output.string();
+        }
         const std::set<std::string> names = namesIn(dir.path());
-        const ToolRun run = runTool(c.arguments(input.string(), output.string()));
+        const ToolRun run = runTool(arguments);
         EXPECT_EQ(run.status, 1);
         EXPECT_EQ(run.err, "veltotouch: " + output.string() + ": is the same file as the " + c.inputIs + " " +
                                input.string() + "; write the " + c.outputIs + " elsewhere\n");

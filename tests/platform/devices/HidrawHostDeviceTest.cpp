@@ -9,6 +9,7 @@
 #include <unistd.h>
 
 #include <array>
+#include <functional>
 #include <thread>
 #include <vector>
 
@@ -60,6 +61,33 @@ struct Received {
     }
 };
 
+// Opens and schedules the device on a loop thread of its own, sends the
+// reports from the peer and runs the loop until each has arrived; `then` runs
+// on that thread before the device is unscheduled, which leaves the loop
+// nothing to run.
+void receive(HidrawHostDevice& device, ReportPipe& pipe, const std::vector<std::vector<std::uint8_t>>& reports,
+             Received& received, const std::function<void()>& then = [] {})
+{
+    std::thread loop([&] {
+        ASSERT_TRUE(device.open(0));
+        device.registerInputReportWithTimeStampCallback(received.buffer.data(), received.buffer.size(),
+                                                        &Received::callback, &received);
+        device.scheduleWithRunLoop(RunLoop::current(), kMode);
+        for (const auto& report : reports) pipe.send(report);
+        while (received.reports.size() < reports.size()) {
+            ASSERT_EQ(RunLoop::run(kMode, std::nullopt, true), RunLoop::RunResult::HandledSource);
+        }
+        then();
+        device.unscheduleFromRunLoop(RunLoop::current(), kMode);
+        EXPECT_EQ(RunLoop::run(kMode, std::nullopt, true), RunLoop::RunResult::Finished);
+        device.registerInputReportWithTimeStampCallback(received.buffer.data(), received.buffer.size(), nullptr,
+                                                        nullptr);
+    });
+    loop.join();
+}
+
+using Report = std::pair<std::uint32_t, std::vector<std::uint8_t>>;
+
 }  // namespace
 
 TEST(HidrawHostDeviceTest, OneReadIsOneReportAndADisappearingDeviceEndsReception)
@@ -68,36 +96,19 @@ TEST(HidrawHostDeviceTest, OneReadIsOneReportAndADisappearingDeviceEndsReception
     ReportPipe pipe;
     HidrawHostDevice device(pipe.deviceEnd, true);
     Received received;
-    std::thread::id loopThread;
-
     const std::uint64_t beforeSending = MonotonicClock::now();
-    std::thread loop([&] {
-        loopThread = std::this_thread::get_id();
-        ASSERT_TRUE(device.open(0));
-        device.registerInputReportWithTimeStampCallback(received.buffer.data(), received.buffer.size(),
-                                                        &Received::callback, &received);
-        device.scheduleWithRunLoop(RunLoop::current(), kMode);
-        pipe.send({0x01, 10, 11});
-        pipe.send({0x02, 1, 2, 3, 4, 5, 6, 7, 8});  // longer than the buffer
-        pipe.send({0x01, 12});
-        while (received.reports.size() < 3) {
-            ASSERT_EQ(RunLoop::run(kMode, std::nullopt, true), RunLoop::RunResult::HandledSource);
-        }
+    // The second is longer than the buffer.
+    receive(device, pipe, {{0x01, 10, 11}, {0x02, 1, 2, 3, 4, 5, 6, 7, 8}, {0x01, 12}}, received, [&] {
         // The peer goes away: reception ends, the source leaves the loop.
         pipe.unplug();
         EXPECT_EQ(RunLoop::run(kMode, std::nullopt, true), RunLoop::RunResult::HandledSource);
         EXPECT_EQ(RunLoop::run(kMode, std::nullopt, true), RunLoop::RunResult::Finished);
-        device.unscheduleFromRunLoop(RunLoop::current(), kMode);
-        device.registerInputReportWithTimeStampCallback(received.buffer.data(), received.buffer.size(), nullptr,
-                                                        nullptr);
     });
-    loop.join();
 
-    ASSERT_EQ(received.reports.size(), 3u);
-    EXPECT_EQ(received.reports[0], (std::pair<std::uint32_t, std::vector<std::uint8_t>>{1, {1, 10, 11}}));
-    EXPECT_EQ(received.reports[1], (std::pair<std::uint32_t, std::vector<std::uint8_t>>{2, {2, 1, 2, 3, 4, 5}}));
-    EXPECT_EQ(received.reports[2], (std::pair<std::uint32_t, std::vector<std::uint8_t>>{1, {1, 12}}));
-    for (auto thread : received.threads) EXPECT_EQ(thread, loopThread);
+    EXPECT_EQ(received.reports, (std::vector<Report>{{1, {1, 10, 11}}, {2, {2, 1, 2, 3, 4, 5}}, {1, {1, 12}}}));
+    ASSERT_EQ(received.threads.size(), 3u);
+    for (auto thread : received.threads) EXPECT_EQ(thread, received.threads[0]);
+    EXPECT_NE(received.threads[0], std::this_thread::get_id());
     // Stamped on the host's clock as each report was read, before its
     // callback: the time the plug-in records it at.
     std::uint64_t previous = beforeSending;
@@ -122,20 +133,8 @@ TEST(HidrawHostDeviceTest, UnnumberedReportsCarryReportIDZero)
     ReportPipe pipe;
     HidrawHostDevice device(pipe.deviceEnd, false);
     Received received;
-    std::thread loop([&] {
-        ASSERT_TRUE(device.open(0));
-        device.registerInputReportWithTimeStampCallback(received.buffer.data(), received.buffer.size(),
-                                                        &Received::callback, &received);
-        device.scheduleWithRunLoop(RunLoop::current(), kMode);
-        pipe.send({0x07, 0x08});
-        EXPECT_EQ(RunLoop::run(kMode, std::nullopt, true), RunLoop::RunResult::HandledSource);
-        device.unscheduleFromRunLoop(RunLoop::current(), kMode);
-        EXPECT_EQ(RunLoop::run(kMode, std::nullopt, true), RunLoop::RunResult::Finished);
-    });
-    loop.join();
-    ASSERT_EQ(received.reports.size(), 1u);
-    EXPECT_EQ(received.reports[0].first, 0u);
-    EXPECT_EQ(received.reports[0].second, (std::vector<std::uint8_t>{0x07, 0x08}));
+    receive(device, pipe, {{0x07, 0x08}}, received);
+    EXPECT_EQ(received.reports, (std::vector<Report>{{0, {0x07, 0x08}}}));
 }
 
 TEST(HidrawHostDeviceTest, RequestsOnANonHidrawDescriptorFailSoftly)
