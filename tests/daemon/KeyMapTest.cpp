@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 #include <linux/input-event-codes.h>
 
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -13,41 +14,43 @@ using Region = Gesture::Region;
 
 namespace {
 
-KeyMap::Action press(unsigned int code) { return {code, true}; }
-KeyMap::Action release(unsigned int code) { return {code, false}; }
-
-std::string describe(const KeyMap::Actions& actions)
+// Gestures written "hold-start middle, hold-end middle": a kind and a region
+// each, by their names; "unknown" is an event the host cannot tell.
+std::vector<Gesture> gesturesOf(const std::string& text)
 {
-    std::string text;
-    for (const KeyMap::Action& action : actions) {
-        text += action.pressed ? '+' : '-';
-        text += KeyMap::keyName(action.code);
-        text += ' ';
+    std::vector<Gesture> gestures;
+    std::istringstream in(text);
+    for (std::string kind, region; in >> kind >> region;) {
+        if (region.ends_with(',')) region.pop_back();
+        gestures.push_back({kind == "unknown" ? Kind::Unknown : Gesture::kindFromName(kind).value(),
+                            Gesture::regionFromName(region).value()});
     }
-    return text.empty() ? "(nothing)" : text;
+    return gestures;
 }
 
 struct Case {
     std::string name;
-    std::vector<Gesture> gestures;
-    KeyMap::Actions expected;
+    std::string gestures;
+    std::string keys;  // "+KEY_A -KEY_A ": each press and release, in order
 };
 
 void runCases(const std::vector<Case>& cases, const KeyMap::Bindings& bindings)
 {
     for (const Case& each : cases) {
         KeyMap map(bindings);
-        KeyMap::Actions actions;
-        for (const Gesture& gesture : each.gestures) {
-            const KeyMap::Actions step = map.handle(gesture);
-            actions.insert(actions.end(), step.begin(), step.end());
+        std::string keys;
+        for (const Gesture& gesture : gesturesOf(each.gestures)) {
+            for (const KeyMap::Action& action : map.handle(gesture)) {
+                keys += (action.pressed ? "+" : "-") + KeyMap::keyName(action.code) + " ";
+            }
         }
-        EXPECT_EQ(describe(actions), describe(each.expected)) << each.name;
+        EXPECT_EQ(keys, each.keys) << each.name;
     }
 }
 
-const Gesture mayBeginTop{Kind::MayBegin, Region::Top};
-const Gesture mayBeginMiddle{Kind::MayBegin, Region::Middle};
+const std::string kVolumeUp = "+KEY_VOLUMEUP -KEY_VOLUMEUP ";
+const std::string kVolumeDown = "+KEY_VOLUMEDOWN -KEY_VOLUMEDOWN ";
+const std::string kVoiceCommand = "+KEY_VOICECOMMAND -KEY_VOICECOMMAND ";
 
 }  // namespace
 
@@ -55,68 +58,36 @@ const Gesture mayBeginMiddle{Kind::MayBegin, Region::Middle};
 // test, and a key held when the device goes is released there.
 TEST(KeyMapTest, DefaultMapTurnsGestureSequencesIntoKeys)
 {
-    const std::vector<Case> cases = {
-        {"tap in no region", {{Kind::Tap, Region::None}}, {}},
-        {"hold at the top clicks once at its start",
-         {mayBeginTop, {Kind::HoldStart, Region::Top}, {Kind::HoldEnd, Region::Top}},
-         {press(KEY_VOLUMEUP), release(KEY_VOLUMEUP)}},
-        {"hold in the middle keeps voice command down until it ends",
-         {mayBeginMiddle, {Kind::HoldStart, Region::Middle}, {Kind::HoldEnd, Region::Middle}},
-         {press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND)}},
-        {"slow slide from the top to the bottom and back",
-         {mayBeginTop,
-          {Kind::HoldStart, Region::Top},
-          {Kind::HoldChange, Region::Middle},
-          {Kind::HoldChange, Region::Bottom},
-          {Kind::HoldChange, Region::Middle},
-          {Kind::HoldChange, Region::Top},
-          {Kind::HoldEnd, Region::Top}},
-         {press(KEY_VOLUMEUP), release(KEY_VOLUMEUP), press(KEY_VOLUMEDOWN), release(KEY_VOLUMEDOWN),
-          press(KEY_VOLUMEUP), release(KEY_VOLUMEUP)}},
-        {"hold that starts in the middle and slides down releases voice command as it leaves",
-         {mayBeginTop, {Kind::HoldStart, Region::Middle}, {Kind::HoldChange, Region::Bottom},
-          {Kind::HoldChange, Region::Middle}, {Kind::HoldEnd, Region::Middle}},
-         {press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND), press(KEY_VOLUMEDOWN), release(KEY_VOLUMEDOWN)}},
-    };
-    runCases(cases, KeyMap::defaultBindings());
+    runCases({{"tap in no region", "tap none", ""},
+              {"hold at the top clicks once at its start", "may-begin top, hold-start top, hold-end top", kVolumeUp},
+              {"hold in the middle keeps voice command down until it ends",
+               "may-begin middle, hold-start middle, hold-end middle", kVoiceCommand},
+              {"slow slide from the top to the bottom and back",
+               "may-begin top, hold-start top, hold-change middle, hold-change bottom, hold-change middle, "
+               "hold-change top, hold-end top",
+               kVolumeUp + kVolumeDown + kVolumeUp},
+              {"hold that starts in the middle and slides down releases voice command as it leaves",
+               "may-begin top, hold-start middle, hold-change bottom, hold-change middle, hold-end middle",
+               kVoiceCommand + kVolumeDown}},
+             KeyMap::defaultBindings());
 }
 
 TEST(KeyMapTest, OddSequencesNeverLeaveAKeyDownOrPressItTwice)
 {
-    const std::vector<Case> cases = {
-        {"hold-end without hold-start", {{Kind::HoldEnd, Region::Middle}}, {}},
-        {"hold-change without hold-start clicks its region",
-         {{Kind::HoldChange, Region::Top}},
-         {press(KEY_VOLUMEUP), release(KEY_VOLUMEUP)}},
-        {"two hold-starts in the middle",
-         {{Kind::HoldStart, Region::Middle}, {Kind::HoldStart, Region::Middle}, {Kind::HoldEnd, Region::Middle}},
-         {press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND), press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND)}},
-        {"a second hold-start elsewhere",
-         {{Kind::HoldStart, Region::Middle}, {Kind::HoldStart, Region::Top}, {Kind::HoldEnd, Region::Top}},
-         {press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND), press(KEY_VOLUMEUP), release(KEY_VOLUMEUP)}},
-        {"cancel mid-hold",
-         {{Kind::HoldStart, Region::Middle}, {Kind::Cancel, Region::None}, {Kind::HoldEnd, Region::Middle}},
-         {press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND)}},
-        {"device reset mid-hold",
-         {{Kind::HoldStart, Region::Middle}, {Kind::DeviceReset, Region::None}, {Kind::Cancel, Region::None}},
-         {press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND)}},
-        {"hold-end lost, next touch begins",
-         {{Kind::HoldStart, Region::Middle}, mayBeginMiddle},
-         {press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND)}},
-        {"hold-end lost, tap arrives",
-         {{Kind::HoldStart, Region::Middle}, {Kind::Tap, Region::Top}},
-         {press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND), press(KEY_VOLUMEUP), release(KEY_VOLUMEUP)}},
-        {"a hold-change into the held region keeps the key",
-         {{Kind::HoldStart, Region::Middle}, {Kind::HoldChange, Region::Middle}, {Kind::HoldEnd, Region::Middle}},
-         {press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND)}},
-        {"unknown events, idle reset and idle cancel",
-         {{Kind::Unknown, Region::Top}, {Kind::DeviceReset, Region::None}, {Kind::Cancel, Region::None}},
-         {}},
-        {"unknown event mid-hold keeps the key",
-         {{Kind::HoldStart, Region::Middle}, {Kind::Unknown, Region::Top}, {Kind::HoldEnd, Region::Middle}},
-         {press(KEY_VOICECOMMAND), release(KEY_VOICECOMMAND)}},
-    };
-    runCases(cases, KeyMap::defaultBindings());
+    runCases({{"hold-end without hold-start", "hold-end middle", ""},
+              {"hold-change without hold-start clicks its region", "hold-change top", kVolumeUp},
+              {"two hold-starts in the middle", "hold-start middle, hold-start middle, hold-end middle",
+               kVoiceCommand + kVoiceCommand},
+              {"a second hold-start elsewhere", "hold-start middle, hold-start top, hold-end top", kVoiceCommand + kVolumeUp},
+              {"cancel mid-hold", "hold-start middle, cancel none, hold-end middle", kVoiceCommand},
+              {"device reset mid-hold", "hold-start middle, device-reset none, cancel none", kVoiceCommand},
+              {"hold-end lost, next touch begins", "hold-start middle, may-begin middle", kVoiceCommand},
+              {"hold-end lost, tap arrives", "hold-start middle, tap top", kVoiceCommand + kVolumeUp},
+              {"a hold-change into the held region keeps the key", "hold-start middle, hold-change middle, hold-end middle",
+               kVoiceCommand},
+              {"unknown events, idle reset and idle cancel", "unknown top, device-reset none, cancel none", ""},
+              {"unknown event mid-hold keeps the key", "hold-start middle, unknown top, hold-end middle", kVoiceCommand}},
+             KeyMap::defaultBindings());
 }
 
 TEST(KeyMapTest, ConfiguredBindingsReplaceTheDefaults)
@@ -127,17 +98,13 @@ TEST(KeyMapTest, ConfiguredBindingsReplaceTheDefaults)
     bindings.clicks[{Kind::HoldEnd, Region::Middle}] = KEY_C;
     bindings.holds[Region::Middle] = KEY_LEFTSHIFT;
     bindings.holds[Region::Top] = KEY_LEFTSHIFT;
-    const std::vector<Case> cases = {
-        {"may-begin click", {mayBeginTop, {Kind::Tap, Region::Top}}, {press(KEY_A), release(KEY_A)}},
-        {"hold-start click, then the held key; release before the hold-end click",
-         {{Kind::HoldStart, Region::Middle}, {Kind::HoldEnd, Region::Middle}},
-         {press(KEY_B), release(KEY_B), press(KEY_LEFTSHIFT), release(KEY_LEFTSHIFT), press(KEY_C), release(KEY_C)}},
-        {"one key held from two regions is released when the hold leaves the first",
-         {{Kind::HoldStart, Region::Top}, {Kind::HoldChange, Region::Middle}, {Kind::HoldEnd, Region::Middle}},
-         {press(KEY_LEFTSHIFT), release(KEY_LEFTSHIFT), press(KEY_C), release(KEY_C)}},
-        {"nothing bound at the bottom", {{Kind::HoldStart, Region::Bottom}, {Kind::HoldEnd, Region::Bottom}}, {}},
-    };
-    runCases(cases, bindings);
+    runCases({{"may-begin click", "may-begin top, tap top", "+KEY_A -KEY_A "},
+              {"hold-start click, then the held key; release before the hold-end click", "hold-start middle, hold-end middle",
+               "+KEY_B -KEY_B +KEY_LEFTSHIFT -KEY_LEFTSHIFT +KEY_C -KEY_C "},
+              {"one key held from two regions is released when the hold leaves the first",
+               "hold-start top, hold-change middle, hold-end middle", "+KEY_LEFTSHIFT -KEY_LEFTSHIFT +KEY_C -KEY_C "},
+              {"nothing bound at the bottom", "hold-start bottom, hold-end bottom", ""}},
+             bindings);
     EXPECT_EQ(KeyMap(bindings).keyCodes(), (std::set<unsigned int>{KEY_A, KEY_B, KEY_C, KEY_LEFTSHIFT}));
 }
 
