@@ -30,7 +30,6 @@ void EventCollector::callback(void* target, void* refcon, void* sender, HidEvent
     delivered.timeStamp = event->timeStamp();
     delivered.usagePage = event->vendorDefined().usagePage;
     delivered.usage = event->vendorDefined().usage;
-    delivered.y = event->digitizer().y;
     delivered.target = target;
     delivered.refcon = refcon;
     delivered.sender = sender;

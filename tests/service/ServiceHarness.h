@@ -30,7 +30,6 @@ struct DeliveredEvent {
     std::uint64_t timeStamp = 0;
     std::uint32_t usagePage = 0;
     std::uint32_t usage = 0;
-    double y = 0;
     void* target = nullptr;
     void* refcon = nullptr;
     void* sender = nullptr;
