@@ -1,7 +1,6 @@
 #include "RecordingTestSupport.h"
 
 #include "recording/ContainerStream.h"
-#include "recording/JsonValue.h"
 
 #include <gtest/gtest.h>
 
@@ -17,7 +16,6 @@
 namespace {
 
 using namespace RecordingTestSupport;
-using VeltoTouch::JsonValue;
 
 void expectSameFrames(const PipelineRecording::FrameList& actual, const PipelineRecording::FrameList& expected)
 {
@@ -114,18 +112,6 @@ TEST(RecordingContainer, VersionZeroMigratesReportsAndBooleansCountAsNumbers)
     EXPECT_TRUE(falseVersion.frames().empty());
 }
 
-TEST(RecordingContainer, MigrationReturnsCurrentContainersAsTheSameValue)
-{
-    const PropertyValue current = JsonValue::parse(R"({"Version": 1, "Frames": [], "Other": 3})");
-    EXPECT_EQ(PipelineRecording::migrateSerializedContainer(current).identity(), current.identity());
-
-    const PropertyValue old = JsonValue::parse(R"({"Version": 0, "Other": 3,
-        "Reports": [{"Timestamp": "kept as it is", "ReportData": 5}]})");
-    const PropertyValue migrated = PipelineRecording::migrateSerializedContainer(old);
-    EXPECT_EQ(migrated, JsonValue::parse(R"({"Version": 1, "Frames": [
-        {"Timestamp": "kept as it is", "Type": "InputReport", "Report": 5}]})"));
-}
-
 enum class Family { InvalidArgument, Runtime };
 
 struct ReadError {
@@ -217,22 +203,6 @@ TEST(RecordingContainer, EveryFaultRaisesItsMessageInItsFamily)
             } catch (...) {
                 ADD_FAILURE() << "unexpected exception type";
             }
-        }
-    }
-}
-
-TEST(RecordingContainer, MigrationAloneRaisesUnprefixedInvalidArgument)
-{
-    const std::pair<PropertyValue, const char*> cases[] = {
-        {PropertyValue(), "invalid container"},
-        {JsonValue::parse(R"({"Version": 7})"), "invalid container version: 7"},
-    };
-    for (const auto& [container, message] : cases) {
-        try {
-            PipelineRecording::migrateSerializedContainer(container);
-            ADD_FAILURE() << "no error raised";
-        } catch (const std::invalid_argument& error) {
-            EXPECT_STREQ(error.what(), message);
         }
     }
 }

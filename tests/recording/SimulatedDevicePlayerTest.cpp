@@ -12,7 +12,6 @@
 #include <atomic>
 #include <cstdio>
 #include <memory>
-#include <stdexcept>
 #include <string>
 #include <thread>
 #include <vector>
@@ -26,21 +25,10 @@ using namespace RecordingTestSupport;
 
 PipelineRecording::Frame report(std::uint8_t id, std::uint64_t timestampNs) { return reportFrame(timestampNs, {id}); }
 
-// Hands over the frames, then raises `fault` unless it is empty.
-SimulatedDevicePlayer::FrameSource frames(std::vector<PipelineRecording::Frame> list, std::string fault = "")
-{
-    return [list = std::move(list), fault](const VeltoTouch::ContainerStream::FrameHandler& onFrame,
-                                           const SimulatedDevicePlayer::StopCheck&) {
-        for (PipelineRecording::Frame frame : list) onFrame(std::move(frame));
-        if (!fault.empty()) throw std::invalid_argument(fault);
-    };
-}
-
-SimulatedDevicePlayer atSpeedZero(const SimulatedHostDevice::Ref& device,
-                                  std::function<bool()> stop = [] { return false; })
+SimulatedDevicePlayer atSpeedZero(const SimulatedHostDevice::Ref& device)
 {
     return SimulatedDevicePlayer(
-        device, [](const std::string&, const PropertyValue&) {}, std::move(stop), {.speed = 0});
+        device, [](const std::string&, const PropertyValue&) {}, [] { return false; }, {.speed = 0});
 }
 
 }  // namespace
@@ -71,41 +59,10 @@ TEST(SimulatedDevicePlayerTest, AStopRequestEndsEveryWait)
     EXPECT_NE(notices[0].find("--max-gap"), std::string::npos);
 }
 
-TEST(SimulatedDevicePlayerTest, AStreamIsPlayedAsItArrivesAndItsFaultComesAfterTheFramesBeforeIt)
-{
-    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();  // never scheduled: reports stay pending
-    SimulatedDevicePlayer player = atSpeedZero(device);
-    EXPECT_EQ(player.playStream(frames({report(1, 10), report(2, 20)})), SimulatedDevicePlayer::Ending::Finished);
-    EXPECT_EQ(device->pendingReportCount(), 2u);
-    try {
-        player.playStream(frames({report(3, 30)}, "invalid report"));
-        ADD_FAILURE() << "the fault was not raised";
-    } catch (const std::invalid_argument& error) {
-        EXPECT_STREQ(error.what(), "invalid report");
-    }
-    EXPECT_EQ(device->pendingReportCount(), 3u);
-    EXPECT_EQ(player.reportsPushed(), 3u);
-}
-
-TEST(SimulatedDevicePlayerTest, AStopEndsAStreamAndIsToldFromAFault)
-{
-    SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
-    bool stop = false;
-    SimulatedDevicePlayer player = atSpeedZero(device, [&] { return stop; });
-    // Stopped between two frames: the rest is not played.
-    const SimulatedDevicePlayer::FrameSource stopping = [&](const VeltoTouch::ContainerStream::FrameHandler& onFrame,
-                                                            const SimulatedDevicePlayer::StopCheck&) {
-        onFrame(report(1, 10));
-        stop = true;
-        onFrame(report(2, 20));
-        ADD_FAILURE() << "played on after the stop";
-    };
-    EXPECT_EQ(player.playStream(stopping), SimulatedDevicePlayer::Ending::Stopped);
-    EXPECT_EQ(player.reportsPushed(), 1u);
-    // A reader cut short by the stop may take it for a fault: it is a stop.
-    EXPECT_EQ(player.playStream(frames({}, "the read was stopped")), SimulatedDevicePlayer::Ending::Stopped);
-}
-
+// A stream's frames before its fault are played before the fault is raised,
+// and a stop, also one the reader took for a fault, ends it as a stop: through
+// host, ReplayCommandTest (a fault after good frames) and HostCommandTest (a
+// stop while the flow goes on, and one while loading).
 TEST(SimulatedDevicePlayerTest, ReadAheadPlaysAContainerFileAndTheNamedDeviceOfAHidRecorderFile)
 {
     const TempFile container(R"({"Version": 1, "Frames": [)"
