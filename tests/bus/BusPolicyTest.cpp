@@ -28,12 +28,11 @@ namespace {
 constexpr const char* kAccessDenied = "org.freedesktop.DBus.Error.AccessDenied";
 
 // What an unprivileged client is expected to find, one bit each in the
-// child's exit code, in this order.
+// child's exit code, in this order. That it may list the devices, read their
+// names and settings, and is refused writes and saved recordings is checked
+// with the installed package, for a user outside the group and a member
+// (tests/packaging/install-test.sh).
 const char* const kExpectations[] = {
-    "may call ListDevices",
-    "may call GetProperty",
-    "may read the Name property",
-    "is refused SetProperty and SaveRecording",
     "is refused the raw touch data (Recording, ServicePluginDebug), with the daemon's reason",
     "may not own the service's name",
     "receives the device's signals",
@@ -66,8 +65,8 @@ bool receivesSignals(ControlClient& client, int readyFd, int goFd)
 }
 
 // Runs in the forked child, as `uid`/`gid`: no test macros, only the exit code.
-int probeAsUnprivileged(const std::string& address, const std::string& device, int file, uid_t uid, gid_t gid,
-                        int readyFd, int goFd)
+int probeAsUnprivileged(const std::string& address, const std::string& device, uid_t uid, gid_t gid, int readyFd,
+                        int goFd)
 {
     if (::setgroups(0, nullptr) != 0 || ::setgid(gid) != 0 || ::setuid(uid) != 0 || ::getuid() != uid) return 0x80;
     ControlClient client(BusConnection::Address::at(address));
@@ -75,16 +74,7 @@ int probeAsUnprivileged(const std::string& address, const std::string& device, i
         std::fprintf(stderr, "unprivileged client: %s\n", client.connectError().c_str());
         return 0x80;
     }
-    ControlClient::Reply listed;
     const bool found[] = {
-        client.listDevices(&listed) == std::vector<std::string>{device} && listed.ok(),
-        [&] {
-            const ControlClient::Reply got = client.getProperty(device, "Pipeline.Algs.HoldTimeoutMilliseconds");
-            return got.error.empty() && !got.value.empty();
-        }(),
-        client.name(device).value == "sim:policy.json",
-        client.setProperty(device, "Pipeline.Algs.HoldTimeoutMilliseconds", "1").error == kAccessDenied &&
-            client.saveRecording(device, file).error == kAccessDenied,
         [&] {
             const ControlClient::Reply got = client.getProperty(device, "Recording");
             return got.error == kAccessDenied && got.message.find("raw touch data") != std::string::npos &&
@@ -100,7 +90,7 @@ int probeAsUnprivileged(const std::string& address, const std::string& device, i
 
 }  // namespace
 
-TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwnNorReadTheRawData)
+TEST(BusPolicyTest, RootMayDoAllAndOthersWatchButNeitherOwnTheNameNorReadTheRawData)
 {
     if (::geteuid() != 0) {
         GTEST_SKIP() << "the policy check drops a child to an unprivileged user, which needs root; running as uid "
@@ -127,7 +117,6 @@ TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwnNor
         EXPECT_EQ(root.getProperty(device.path(), "Recording").error, "");
         EXPECT_EQ(root.saveRecording(device.path(), saved).error, "");
         EXPECT_GT(std::filesystem::file_size(file), 0u);
-        ASSERT_EQ(::ftruncate(saved, 0), 0);
     }
 
     int ready[2];
@@ -136,7 +125,7 @@ TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwnNor
     ASSERT_EQ(::pipe(go), 0);
     const pid_t child = ::fork();
     ASSERT_GE(child, 0) << std::strerror(errno);
-    if (child == 0) ::_exit(probeAsUnprivileged(bus.address(), device.path(), saved, uid, gid, ready[1], go[0]));
+    if (child == 0) ::_exit(probeAsUnprivileged(bus.address(), device.path(), uid, gid, ready[1], go[0]));
     ::close(ready[1]);
     ::close(go[0]);
     char signalled = 0;
@@ -156,10 +145,5 @@ TEST(BusPolicyTest, UnprivilegedUsersReadAndWatchButNeitherWriteNorSaveNorOwnNor
     for (std::size_t i = 0; i < std::size(kExpectations); ++i) {
         EXPECT_TRUE(found & (1 << i)) << "an unprivileged user " << kExpectations[i];
     }
-    // The refused write did not land.
-    PropertyValue timeout;
-    ASSERT_TRUE(device.control().getProperty("Pipeline.Algs.HoldTimeoutMilliseconds", timeout).isOk());
-    EXPECT_EQ(timeout.toUInt64(), 600u);
-    EXPECT_EQ(std::filesystem::file_size(file), 0u);
     ::close(saved);
 }
