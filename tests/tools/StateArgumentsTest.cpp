@@ -3,7 +3,6 @@
 
 #include <gtest/gtest.h>
 
-#include <limits>
 #include <optional>
 #include <string>
 
@@ -59,15 +58,6 @@ TEST(StateArguments, SettingsThePipelineConvertedAreNamedWithBothValues)
     for (const Case& c : cases) {
         EXPECT_EQ(warningFor(c.key, c.value), c.warning) << c.key << "=" << c.value;
     }
-}
-
-TEST(StateArguments, NotANumberReadBackAsNotANumberTookAsWritten)
-{
-    // Values that do not come from the command line: a caller may hold a NaN.
-    const PropertyValue nan = PropertyValue::float64(std::numeric_limits<double>::quiet_NaN());
-    EXPECT_EQ(StateArguments::readBackWarning("k", nan, PropertyValue::float32(std::numeric_limits<float>::quiet_NaN())),
-              std::nullopt);
-    EXPECT_NE(StateArguments::readBackWarning("k", nan, PropertyValue::float32(0)), std::nullopt);
 }
 
 }  // namespace
