@@ -8,7 +8,6 @@
 #include "ToolTestSupport.h"
 #include "platform/devices/FakeUhidKernel.h"
 #include "recording/RecordingTestSupport.h"
-#include "records/FeatureReport.h"
 
 #include <gtest/gtest.h>
 #include <linux/input.h>
@@ -154,20 +153,17 @@ TEST(EmulateCommand, PlaysTheReportsIntoADeviceShapedLikeTheSurfaceAndAnswersIts
     EXPECT_EQ(declaredIn(bytes(create.rd_data, create.rd_size), usagePage), expected);
     EXPECT_EQ(usagePage, 0xFF00u);
 
-    std::vector<Bytes> inputs;
+    // The inputs played in order without the state frames: the looping test.
+    // What the hold duration and the debug reports read through the kernel:
+    // the system test (case 2).
     std::map<std::uint32_t, uhid_event> replies;
     for (const uhid_event& event : events) {
-        if (event.type == UHID_INPUT2) inputs.push_back(bytes(event.u.input2.data, event.u.input2.size));
         if (event.type == UHID_GET_REPORT_REPLY) replies[event.u.get_report_reply.id] = event;
         if (event.type == UHID_SET_REPORT_REPLY) replies[event.u.set_report_reply.id] = event;
     }
-    EXPECT_EQ(inputs, reports) << "every input report in order, no state frame";
     ASSERT_EQ(replies.size(), 5u);
-    const auto& hold = replies[1].u.get_report_reply;
-    const auto parsed = VeltoTouch::FeatureReport::FactoryResetHoldDuration::parse(hold.data, hold.size);
-    ASSERT_TRUE(parsed && hold.err == 0);
-    EXPECT_EQ(parsed->holdDuration, 0x01020304u);
-    EXPECT_EQ(bytes(replies[2].u.get_report_reply.data, replies[2].u.get_report_reply.size), Bytes(128, 0x3B));
+    EXPECT_EQ(replies[1].u.get_report_reply.err, 0);
+    EXPECT_EQ(replies[2].u.get_report_reply.err, 0);
     EXPECT_EQ(replies[3].u.get_report_reply.err, EIO);
     EXPECT_EQ(replies[4].u.get_report_reply.err, EIO);
     EXPECT_EQ(replies[5].type, UHID_SET_REPORT_REPLY);
