@@ -26,8 +26,8 @@ TEST(AlgsState, NormalizationFactorsReadAndWriteByIndex)
     EXPECT_TRUE(get(pipeline, domain + ".23").isNull());
     EXPECT_TRUE(get(pipeline, domain).isNull());
 
+    // Written and read back, and one past the table unknown: StateArgumentsTest.
     set(pipeline, domain + ".7", PropertyValue::float64(0.5));
-    EXPECT_EQ(get(pipeline, domain + ".7"), PropertyValue::float32(0.5f));
     EXPECT_EQ(get(pipeline, domain + ".8"), PropertyValue::float32(0.6667f)) << "only factor 7 moved";
     // The table changes; the group's virtual pixel keeps the gain it was built with.
     EXPECT_EQ(pipeline.algs().virtualPixels[7].gain, 0.4651f);
@@ -35,7 +35,6 @@ TEST(AlgsState, NormalizationFactorsReadAndWriteByIndex)
     set(pipeline, domain + ".99", PropertyValue::float64(0.5));
     set(pipeline, domain, PropertyValue::float64(0.5));
     EXPECT_EQ(get(pipeline, domain + ".0"), PropertyValue::float32(0.6667f));
-    EXPECT_TRUE(get(pipeline, domain + ".99").isNull());
 }
 
 // Every key of the table is reached by its name only (an indexed one with

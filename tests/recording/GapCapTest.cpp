@@ -11,6 +11,8 @@ using VeltoHost::GapCap;
 
 namespace {
 
+// Waits well below the limit, and a limit of 0, through replay:
+// ReplayCommandTest.
 TEST(GapCap, WaitsUpToTheLimitAreKeptAndLongerOnesCut)
 {
     constexpr std::uint64_t kMax = std::numeric_limits<std::uint64_t>::max();
@@ -20,12 +22,10 @@ TEST(GapCap, WaitsUpToTheLimitAreKeptAndLongerOnesCut)
         std::uint64_t expected;
     };
     const Case cases[] = {
-        {1.0, 999'999, 999'999},
         {1.0, 1'000'000, 1'000'000},
         {1.0, 1'000'001, 1'000'000},
         {1.0, kMax, 1'000'000},
         {0.25, 10'000'000, 250'000},
-        {0.0, 1, 0},
         // A limit beyond what 64 bits of microseconds hold cuts nothing.
         {1e300, kMax, kMax},
         {1.8446744073709552e13, kMax, kMax},
