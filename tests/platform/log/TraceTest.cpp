@@ -4,7 +4,20 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <stdexcept>
 #include <string>
+
+using VeltoHost::Trace;
+using VeltoHost::TracePoint;
+
+// Trace points sit on the input-report thread, which must never see an
+// exception: a failing observer is the observer's problem.
+TEST(Trace, ThrowingObserverDoesNotEscape)
+{
+    Trace::setObserver([](const TracePoint&) { throw std::runtime_error("observer failed"); });
+    EXPECT_NO_THROW(Trace::emit(1));
+    Trace::setObserver({});
+}
 
 // Tracers attach to the file that holds the probe: the platform library, not
 // the programs that load it. README's bpftrace line names that file.
