@@ -2,7 +2,6 @@
 
 #include "platform/values/PropertyDictionary.h"
 #include "recording/ContainerFrames.h"
-#include "recording/ContainerWriter.h"
 #include "recording/HidRecorderReader.h"
 #include "recording/JsonValue.h"
 #include "recording/PropertyValueBuilder.h"
