@@ -404,8 +404,7 @@ void BusService::sendAnswer(sd_bus_message* call, const std::string& client, con
 {
     int result = 0;
     if (!answer.error.empty()) {
-        sd_bus_error error = SD_BUS_ERROR_MAKE_CONST(answer.error.c_str(), answer.message.c_str());
-        result = sd_bus_reply_method_error(call, &error);
+        result = sd_bus_reply_method_errorf(call, answer.error.c_str(), "%s", answer.message.c_str());
     } else if (answer.value) {
         result = sd_bus_reply_method_return(call, "s", answer.value->c_str());
     } else {
