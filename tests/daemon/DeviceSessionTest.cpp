@@ -53,16 +53,6 @@ private:
 
 PipelineRecording recordingOf(const std::string& name) { return PipelineRecording{std::string_view(readFile(kExamples + "/" + name))}; }
 
-// Plays a recording into the session's simulated device as the daemon plays
-// a sim file, as fast as the plug-in takes it; returns once it has taken every
-// report (its events may still be on their way to the keys).
-void play(DeviceSession& session, const SimulatedHostDevice::Ref& device, const PipelineRecording& recording)
-{
-    SimulatedDevicePlayer player(device, session.stateWriter(), [] { return false; }, {.speed = 0});
-    for (const PipelineRecording::Frame& frame : recording.frames()) player.play(frame);
-    player.waitUntilTaken();
-}
-
 // The first `reports` input reports of a recording, with the state frames among them.
 PipelineRecording cutAfter(const PipelineRecording& recording, std::size_t reports)
 {
@@ -92,7 +82,7 @@ TEST(DeviceSessionTest, GesturesBecomeKeysAndAHeldKeyIsReleasedWhenTheDeviceGoes
         SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
         DeviceSession session("sim:taps.json", device, VELTO_SERVICE_MODULE_PATH, outputs);
         ASSERT_EQ(session.busId(), std::optional<BusService::DeviceId>(0));
-        play(session, device, recordingOf("taps.json"));
+        playInto(session, device, recordingOf("taps.json"));
     }
     // Taps at the top, in the middle and at the bottom.
     EXPECT_EQ(keyboard.actions(), (std::vector<std::string>{"+KEY_VOLUMEUP", "-KEY_VOLUMEUP", "+KEY_PLAYPAUSE",
@@ -104,7 +94,7 @@ TEST(DeviceSessionTest, GesturesBecomeKeysAndAHeldKeyIsReleasedWhenTheDeviceGoes
         SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
         DeviceSession session("sim:holds.json", device, VELTO_SERVICE_MODULE_PATH, outputs);
         EXPECT_EQ(session.busId(), std::optional<BusService::DeviceId>(1));
-        play(session, device, cutAfter(recordingOf("holds.json"), 250));  // hold-start at frame 217
+        playInto(session, device, cutAfter(recordingOf("holds.json"), 250));  // hold-start at frame 217
     }
     const std::vector<std::string> actions = keyboard.actions();
     ASSERT_GE(actions.size(), 2u);
@@ -123,12 +113,12 @@ TEST(DeviceSessionTest, NewKeysTakeOverBetweenEventsAndTheHeldKeyIsReleasedWhere
         SimulatedHostDevice::Ref device = SimulatedHostDevice::create();
         DeviceSession session("sim:holds.json", device, VELTO_SERVICE_MODULE_PATH,
                               {nullptr, &before, &keyboardLock, KeyMap::defaultBindings()});
-        play(session, device, cutAfter(recordingOf("holds.json"), 250));
+        playInto(session, device, cutAfter(recordingOf("holds.json"), 250));
         // Mid-hold: the voice command key is down.
         ASSERT_TRUE(before.waitFor("+KEY_VOICECOMMAND"));
         session.changeKeys(muted, &after);
         EXPECT_EQ(before.actions().back(), "-KEY_VOICECOMMAND");
-        play(session, device, recordingOf("taps.json"));
+        playInto(session, device, recordingOf("taps.json"));
     }
     // A tap at the top, then the hold in the middle.
     EXPECT_EQ(before.actions(), (std::vector<std::string>{"+KEY_VOLUMEUP", "-KEY_VOLUMEUP", "+KEY_VOICECOMMAND",

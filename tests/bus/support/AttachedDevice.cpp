@@ -25,11 +25,16 @@ AttachedDevice::~AttachedDevice() = default;
 
 void AttachedDevice::detach() { _session.reset(); }
 
-std::uint64_t AttachedDevice::play(const std::string& recordingPath)
+std::uint64_t playInto(DeviceSession& session, const SimulatedHostDevice::Ref& device,
+                       const VeltoTouch::PipelineRecording& recording)
 {
-    const VeltoTouch::PipelineRecording recording{std::string_view(readFile(recordingPath))};
-    VeltoHost::SimulatedDevicePlayer player(_device, _session->stateWriter(), [] { return false; }, {.speed = 0});
+    SimulatedDevicePlayer player(device, session.stateWriter(), [] { return false; }, {.speed = 0});
     for (const VeltoTouch::PipelineRecording::Frame& frame : recording.frames()) player.play(frame);
     player.waitUntilTaken();
     return player.reportsPushed();
+}
+
+std::uint64_t AttachedDevice::play(const std::string& recordingPath)
+{
+    return playInto(*_session, _device, VeltoTouch::PipelineRecording{std::string_view(readFile(recordingPath))});
 }

@@ -4,6 +4,7 @@
 #include "daemon/DeviceSession.h"
 #include "platform/devices/SimulatedHostDevice.h"
 
+#include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
@@ -40,3 +41,10 @@ private:
 
 // The text of a file (empty when it cannot be read).
 std::string readFile(const std::string& path);
+
+// Plays a recording into a session's simulated device as the daemon plays a
+// sim file, as fast as the plug-in takes it; returns once the plug-in has
+// taken every report (its events may still be on their way), with the number
+// of reports pushed.
+std::uint64_t playInto(VeltoHost::DeviceSession& session, const VeltoHost::SimulatedHostDevice::Ref& device,
+                       const VeltoTouch::PipelineRecording& recording);
